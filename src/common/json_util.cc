@@ -1,8 +1,8 @@
 #include "corvpkg/json_util.h"
 
 #include <fcntl.h>
-#include <sys/stat.h>
 #include <stdio.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <fstream>

@@ -8,7 +8,7 @@
 #include <system_error>
 
 class TempDir {
-public:
+  public:
     TempDir() {
         char tmpl[] = "/tmp/corvpkg-test.XXXXXX";
         const char* made = mkdtemp(tmpl);
@@ -16,12 +16,13 @@ public:
     }
     ~TempDir() {
         std::error_code ec;  // a leftover temporary directory is harmless
-        if (!path_.empty()) std::filesystem::remove_all(path_, ec);
+        if (!path_.empty())
+            std::filesystem::remove_all(path_, ec);
     }
     TempDir(const TempDir&) = delete;
     TempDir& operator=(const TempDir&) = delete;
     const std::string& path() const { return path_; }
 
-private:
+  private:
     std::string path_;
 };

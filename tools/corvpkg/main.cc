@@ -1,4 +1,77 @@
-// corvpkg: the command line over libcorvpkg. It parses, calls the library and prints.
-#include <cstdio>
+// corvpkg: the command line over libcorvpkg.
+#include <stdio.h>
+#include <string.h>
 
-int main() { return 0; }
+#include <string>
+#include <vector>
+
+#include "cli.h"
+#include "corvpkg/corvpkg.h"
+
+namespace cli {
+
+const std::vector<Command>& commands() {
+    static const std::vector<Command> table = {
+        {"info", "show a package directory's INFO as the engine reads it",
+         "usage: corvpkg info <package-dir> [--json] [--lang L]\n"
+         "\n"
+         "Reads <package-dir>/INFO (and conf/PKG_DEPS, conf/PKG_CONX) with every key\n"
+         "selected and prints the record.\n"
+         "  --json     print the record as one JSON object\n"
+         "  --lang L   language of the display name and description (enu, ger, ...);\n"
+         "             default: the system's language\n"
+         "Exit status: 0 when the INFO is valid, 1 when it is not, 2 for a usage error.\n",
+         cmdInfo},
+    };
+    return table;
+}
+
+}  // namespace cli
+
+namespace {
+
+void printHelp() {
+    printf(
+        "usage: corvpkg <command> [options]\n"
+        "       corvpkg --version | --help\n"
+        "       corvpkg <command> --help\n\n"
+        "The package engine of the NOS appliance.\n\ncommands:\n");
+    for (const cli::Command& command : cli::commands()) {
+        printf("  %-12s %s\n", command.name, command.summary);
+    }
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+    std::vector<std::string> args(argv + 1, argv + argc);
+    if (args.empty()) {
+        printHelp();
+        return cli::EXIT_USAGE;
+    }
+    if (args[0] == "--help" || args[0] == "-h" || args[0] == "help") {
+        printHelp();
+        return cli::EXIT_OK;
+    }
+    if (args[0] == "--version") {
+        printf("corvpkg %s (libcorvpkg.so.1, NOS %d.%d-%d)\n",
+               CORVPackageTool::CORVPKGLibraryVersion(), CORVPackageTool::PKG_OS_MAJOR,
+               CORVPackageTool::PKG_OS_MINOR, CORVPackageTool::PKG_OS_BUILD);
+        return cli::EXIT_OK;
+    }
+    for (const cli::Command& command : cli::commands()) {
+        if (args[0] != command.name) {
+            continue;
+        }
+        std::vector<std::string> rest(args.begin() + 1, args.end());
+        for (const std::string& arg : rest) {
+            if (arg == "--help" || arg == "-h") {
+                printf("%s", command.usage);
+                return cli::EXIT_OK;
+            }
+        }
+        return command.run(rest);
+    }
+    fprintf(stderr, "corvpkg: unknown command '%s'; see corvpkg --help\n", args[0].c_str());
+    return cli::EXIT_USAGE;
+}

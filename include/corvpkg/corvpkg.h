@@ -1,0 +1,15 @@
+// The whole exported interface of libcorvpkg.
+#pragma once
+
+#include "corvpkg/json_util.h"
+#include "corvpkg/packagemanager.h"
+#include "corvpkg/pkginfo.h"
+#include "corvpkg/pkginfo_json.h"
+#include "corvpkg/pkgtool.h"
+#include "corvpkg/pkgtypes.h"
+#include "corvpkg/visibility.h"
+
+namespace CORVPackageTool {
+// The library's own version, e.g. "1.0.0".
+CORVPKG_API const char* CORVPKGLibraryVersion();
+}  // namespace CORVPackageTool

@@ -1,0 +1,7 @@
+#include "corvpkg/corvpkg.h"
+
+namespace CORVPackageTool {
+const char* CORVPKGLibraryVersion() {
+    return CORVPKG_VERSION;
+}
+}  // namespace CORVPackageTool

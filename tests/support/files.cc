@@ -1,0 +1,49 @@
+#include "support/files.h"
+
+#include <stdio.h>
+#include <stdlib.h>
+
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <system_error>
+
+namespace testutil {
+
+void writeFile(const std::string& path, const std::string& content) {
+    std::error_code ec;
+    std::filesystem::create_directories(std::filesystem::path(path).parent_path(), ec);
+    std::ofstream out(path, std::ios::binary | std::ios::trunc);
+    out << content;
+    if (!out) {
+        fprintf(stderr, "test setup: cannot write %s\n", path.c_str());
+        abort();
+    }
+}
+
+std::string readFile(const std::string& path) {
+    std::ifstream in(path, std::ios::binary);
+    std::ostringstream text;
+    text << in.rdbuf();
+    return text.str();
+}
+
+bool exists(const std::string& path) {
+    std::error_code ec;
+    return std::filesystem::exists(std::filesystem::symlink_status(path, ec));
+}
+
+void removeAll(const std::string& path) {
+    std::error_code ec;
+    std::filesystem::remove_all(path, ec);
+}
+
+std::string infoText(const std::vector<std::pair<std::string, std::string>>& keys) {
+    std::string text;
+    for (const auto& [key, value] : keys) {
+        text += key + "=\"" + value + "\"\n";
+    }
+    return text;
+}
+
+}  // namespace testutil

@@ -1,0 +1,20 @@
+// Small file helpers for tests that build package directories and system files.
+#pragma once
+
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace testutil {
+
+// Writes `content` to `path`, creating the parent directories. Aborts the test program
+// when the file cannot be written: every later assertion would be meaningless.
+void writeFile(const std::string& path, const std::string& content);
+std::string readFile(const std::string& path);
+bool exists(const std::string& path);
+void removeAll(const std::string& path);
+
+// An INFO text from key/value pairs, one `key="value"` line each, in the given order.
+std::string infoText(const std::vector<std::pair<std::string, std::string>>& keys);
+
+}  // namespace testutil

@@ -1,0 +1,63 @@
+// The command line's frame: a table of commands, each a function over its arguments.
+// Commands parse, call the library and print; they decide nothing themselves.
+#pragma once
+
+#include <json/json.h>
+
+#include <string>
+#include <vector>
+
+namespace cli {
+
+// Exit statuses of the program.
+enum ExitStatus {
+    EXIT_OK = 0,
+    EXIT_FAILED = 1,  // the library refused or failed; details were printed
+    EXIT_USAGE = 2,   // the command line itself was wrong
+};
+
+struct Command {
+    const char* name;
+    const char* summary;
+    const char* usage;  // the full help text of the command
+    int (*run)(const std::vector<std::string>& args);
+};
+
+const std::vector<Command>& commands();
+
+// Options common to most commands, taken out of `args` by parseCommon.
+struct CommonOptions {
+    bool json = false;
+    std::string lang;  // empty: the system's language
+    std::vector<std::string> positional;
+};
+// False (after printing why) when an option is unknown or lacks its value. `extra` lists
+// further flags without value that the command accepts; they are left in `flags`.
+bool parseCommon(const std::vector<std::string>& args, const Command& command, CommonOptions& out,
+                 const std::vector<std::string>& extra = {},
+                 std::vector<std::string>* flags = nullptr);
+
+// Prints a failure as "error: <CODE_NAME> (<code>): <reason>", or with --json as
+// {"success":false,"code":N,"name":"...","reason":"...","data":...}. Returns EXIT_FAILED.
+int printFailure(bool json, int code, const std::string& reason,
+                 const Json::Value& data = Json::Value());
+// The usage error path: message and the command's usage on standard error.
+int usageError(const Command& command, const std::string& message);
+
+// Collects the library's log lines while alive, so that a failure can say why.
+class LogCapture {
+  public:
+    LogCapture();
+    ~LogCapture();
+    LogCapture(const LogCapture&) = delete;
+    LogCapture& operator=(const LogCapture&) = delete;
+    // The collected lines without their "file:line " prefixes, joined by "; ".
+    std::string reasons() const;
+
+  private:
+    std::vector<std::string> lines_;
+};
+
+int cmdInfo(const std::vector<std::string>& args);
+
+}  // namespace cli

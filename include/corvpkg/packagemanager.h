@@ -57,6 +57,15 @@ class CORVPKG_API PackageManager {
     void insertJsonParam(std::string key, const Json::Value& value);
     Json::Value getJsonParam(std::string key);
 
+    // The volume for a package's files: "/volume1" on a small-box model, the system
+    // install path for a package of install_type "system", else the volume of `volume`;
+    // it must have `size` plus the margin free. False with the reason in the platform error.
+    bool GetAppStoreVolume(const PackageInfo& info, const char* volume, unsigned long long size,
+                           std::string& out);
+    // A precheck before a package file is looked at: the file exists, there is room for it
+    // where it must go, and a volume exists when the package needs one.
+    bool CheckVolume(const char* cpkFile, const PackageInfo& info);
+
     std::string getFixedLogFilePath(const std::string& name);
     std::string getLogFilePath();
 

@@ -6,6 +6,8 @@
 // ready.
 #pragma once
 
+#include <json/json.h>
+
 #include <string>
 
 #include "corvpkg/pkginfo.h"
@@ -73,4 +75,12 @@ CORVPKG_API bool PMSCheckPackageArchMatched(const PackageInfo& info);
 CORVPKG_API bool PMSCheckPackageModelMatched(const PackageInfo& info);
 CORVPKG_API bool PMSCheckPackageArchModelMatched(const PackageInfo& info);
 
+}  // namespace CORVPackageTool
+
+namespace CORVPackageTool {
+// What this machine offers packages, for people and scripts: the OS version, platform
+// code and architecture mask, model ("unique"), small-box flag, volumes with free bytes
+// and readiness, the default volume, and the temporary directory that an install of
+// `installSize` bytes would use (or the platform error why there is none).
+CORVPKG_API Json::Value PMSGetSystemInfo(unsigned long long installSize);
 }  // namespace CORVPackageTool

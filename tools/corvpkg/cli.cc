@@ -1,6 +1,7 @@
 #include "cli.h"
 
 #include <stdio.h>
+#include <stdlib.h>
 #include <string.h>
 
 #include <algorithm>
@@ -10,27 +11,56 @@
 
 namespace cli {
 
+const Command& findCommand(const char* name) {
+    for (const Command& command : commands()) {
+        if (strcmp(command.name, name) == 0) {
+            return command;
+        }
+    }
+    abort();  // only called with the names of the table
+}
+
 bool parseCommon(const std::vector<std::string>& args, const Command& command, CommonOptions& out,
-                 const std::vector<std::string>& extra, std::vector<std::string>* flags) {
+                 const std::vector<OptionSpec>& extra) {
+    std::vector<OptionSpec> specs = {{"--json", false}, {"--lang", true}};
+    specs.insert(specs.end(), extra.begin(), extra.end());
     for (size_t i = 0; i < args.size(); ++i) {
         const std::string& arg = args[i];
-        if (arg == "--json") {
-            out.json = true;
-        } else if (arg == "--lang") {
-            if (i + 1 >= args.size()) {
-                usageError(command, "--lang needs a language code, such as enu or ger");
-                return false;
-            }
-            out.lang = args[++i];
-        } else if (arg.rfind("--lang=", 0) == 0) {
-            out.lang = arg.substr(7);
-        } else if (std::find(extra.begin(), extra.end(), arg) != extra.end() && flags) {
-            flags->push_back(arg);
-        } else if (arg.size() > 1 && arg[0] == '-') {
+        if (arg.size() < 2 || arg[0] != '-') {
+            out.positional.push_back(arg);
+            continue;
+        }
+        std::string name = arg;
+        std::string value;
+        bool inlineValue = false;
+        size_t eq = arg.find('=');
+        if (eq != std::string::npos) {
+            name = arg.substr(0, eq);
+            value = arg.substr(eq + 1);
+            inlineValue = true;
+        }
+        auto spec = std::find_if(specs.begin(), specs.end(),
+                                 [&](const OptionSpec& s) { return name == s.name; });
+        if (spec == specs.end()) {
             usageError(command, "unknown option " + arg);
             return false;
+        }
+        if (spec->takesValue && !inlineValue) {
+            if (i + 1 >= args.size()) {
+                usageError(command, name + " needs a value");
+                return false;
+            }
+            value = args[++i];
+        } else if (!spec->takesValue && inlineValue) {
+            usageError(command, name + " takes no value");
+            return false;
+        }
+        if (name == "--json") {
+            out.json = true;
+        } else if (name == "--lang") {
+            out.lang = value;
         } else {
-            out.positional.push_back(arg);
+            out.options[name] = value;
         }
     }
     return true;

@@ -4,6 +4,7 @@
 
 #include <json/json.h>
 
+#include <map>
 #include <string>
 #include <vector>
 
@@ -24,18 +25,26 @@ struct Command {
 };
 
 const std::vector<Command>& commands();
+const Command& findCommand(const char* name);
 
-// Options common to most commands, taken out of `args` by parseCommon.
+// A command's own option: a flag, or an option with a value ("--size N" or "--size=N").
+struct OptionSpec {
+    const char* name;
+    bool takesValue;
+};
+
+// What parseCommon took out of the arguments.
 struct CommonOptions {
     bool json = false;
     std::string lang;  // empty: the system's language
     std::vector<std::string> positional;
+    std::map<std::string, std::string> options;  // the command's own; "" for a flag
+    bool has(const char* name) const { return options.count(name) != 0; }
 };
-// False (after printing why) when an option is unknown or lacks its value. `extra` lists
-// further flags without value that the command accepts; they are left in `flags`.
+// --json and --lang for every command, plus `extra`. False (after printing why) when an
+// option is unknown or lacks its value.
 bool parseCommon(const std::vector<std::string>& args, const Command& command, CommonOptions& out,
-                 const std::vector<std::string>& extra = {},
-                 std::vector<std::string>* flags = nullptr);
+                 const std::vector<OptionSpec>& extra = {});
 
 // Prints a failure as "error: <CODE_NAME> (<code>): <reason>", or with --json as
 // {"success":false,"code":N,"name":"...","reason":"...","data":...}. Returns EXIT_FAILED.
@@ -59,5 +68,6 @@ class LogCapture {
 };
 
 int cmdInfo(const std::vector<std::string>& args);
+int cmdSystem(const std::vector<std::string>& args);
 
 }  // namespace cli

@@ -22,6 +22,15 @@ const std::vector<Command>& commands() {
          "             default: the system's language\n"
          "Exit status: 0 when the INFO is valid, 1 when it is not, 2 for a usage error.\n",
          cmdInfo},
+        {"system", "show the OS, architecture, volumes and temporary space",
+         "usage: corvpkg system [--size BYTES] [--json]\n"
+         "\n"
+         "Shows the OS version, the platform code and architecture mask, the model, every\n"
+         "volume with its free space and readiness, the default volume for packages, and\n"
+         "the temporary directory that an install of BYTES bytes would use (default 0).\n"
+         "  --size BYTES  size of the install to plan temporary space for\n"
+         "  --json        print one JSON object\n",
+         cmdSystem},
     };
     return table;
 }

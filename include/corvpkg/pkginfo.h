@@ -40,6 +40,11 @@ class CORVPKG_API PackageBasicInfo {
     PackageBasicInfo();
     PackageBasicInfo(std::string name, std::string version);
 
+    // Whether this package stands in relation `op` to `other`: false for different names;
+    // PKG_COMPOP_NONE holds for the same name. Versions are compared number by number after
+    // bringing both to the same count of dotted parts; "." and "-" delimit alike.
+    bool compare(const PackageBasicInfo& other, PKG_VERSION_COMPOP op) const;
+
     std::string package;
     std::string version;
     PKG_VERSION_COMPOP compop = PKG_COMPOP_NONE;
@@ -53,10 +58,16 @@ class CORVPKG_API DepPkgVector : public std::vector<PackageBasicInfo> {
     // Appends one entry. A package named "Python" is never a dependency or a conflict:
     // it is dropped here, where every form of list passes, and false is returned.
     bool pushDepPkg(std::string name, std::string version, PKG_VERSION_COMPOP op);
+    // The JSON form: {"name": {">=": "1.0", "<=": "2.0"}, "other": ""}; null when empty.
+    void toJSON(Json::Value& out) const;
 };
 
 // Package name to identity, ordered by byte comparison of the name.
-class CORVPKG_API PackageBasicInfoMap : public std::map<std::string, PackageBasicInfo> {};
+class CORVPKG_API PackageBasicInfoMap : public std::map<std::string, PackageBasicInfo> {
+  public:
+    // Inserts an entry under `name`; an existing entry stays.
+    void insertPackagae(std::string name, std::string version, bool beta, PKG_VERSION_COMPOP op);
+};
 
 // Extension of PackageInfo, deep-copied: two PackageInfo values never share one.
 class CORVPKG_API PackageInfoExtra {

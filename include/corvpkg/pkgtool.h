@@ -36,6 +36,22 @@ CORVPKG_API int PMSLoadDepConfFile(const char* path, DepPkgVector& out);
 // The sign of this OS version minus `version` (major, minor, build); 0 for 0.0-0.
 CORVPKG_API int PMSCompareOSVersion(const int version[3]);
 
+// Versions. Appends the normal form of `version` (extended with ".0" parts to as many
+// dotted parts as `reference`, build number kept, further "-" pieces dropped) to the
+// malloc'ed `*buffer`. False when either text has no first piece.
+CORVPKG_API bool NormalizeVersion(const char* version, const char* reference, char** buffer,
+                                  int* capacity);
+CORVPKG_API bool NormalizeVersion(std::string version, std::string reference, std::string& normal);
+// 0 when this OS lies within the package's limits, -1 when it is too old, 1 too new.
+CORVPKG_API int PMSComparePackageAndOSVersion(PackageInfo& info);
+CORVPKG_API bool PMSCheckPackageVersionVaild(PackageInfo& info);
+
+// Dependency lists in JSON: {"name": {} | {"pkg_min_ver": ..., ">=": ..., ...}}. The number
+// of members that applied on this OS; 0 for anything that is not an object.
+CORVPKG_API int PMSParseDepJSON(const Json::Value& json, DepPkgVector& out);
+// The same from text: 0 for an empty text, -1 when it is not JSON.
+CORVPKG_API int PMSParseDepJSONString(const std::string& text, DepPkgVector& out);
+
 // The mask of an architecture token, exact and case-sensitive; 0 when unknown.
 CORVPKG_API int PMSMapSystemArch(const char* token);
 

@@ -172,7 +172,7 @@ const char kUsage[] =
     "killed by signal N), 125 if the sandbox could not be set up.\n";
 
 [[noreturn]] void usage_error(const std::string& what) {
-    fprintf(stderr, "%s: %s\n%s", kProgram, what.c_str(), kUsage);
+    fprintf(stderr, "%s: %s (see %s --help)\n", kProgram, what.c_str(), kProgram);
     exit(kSandboxFailed);
 }
 

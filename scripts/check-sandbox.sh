@@ -39,7 +39,16 @@ check "the host does not see the file" test ! -e "$probe"
 second=$("$sandbox" -- sh -c "cat $probe /volume1/probe 2>/dev/null || echo absent")
 check "the second run does not see the files" test "$second" = absent
 
-# 2. Exit statuses.
+# 2. Volumes: one of 64 MiB by default, as asked otherwise.
+sizes=$("$sandbox" -- df -B1 --output=size /volume1 | tail -n 1)
+check "/volume1 is 64 MiB by default" test "$sizes" -eq 67108864
+sizes=$("$sandbox" --volume /volume1:32M --volume /volume2:1G -- \
+    df -B1 --output=size /volume1 /volume2 | tail -n 2 | tr -d ' ' | tr '\n' ' ')
+check "--volume sets sizes and replaces the default" test "$sizes" = "33554432 1073741824 "
+volumes=$("$sandbox" --no-volume -- sh -c 'ls -d /volume* 2>/dev/null || echo none')
+check "--no-volume gives none" test "$volumes" = none
+
+# 3. Exit statuses.
 status=0
 "$sandbox" -- sh -c 'exit 7' || status=$?
 check "the command's exit status comes through" test "$status" -eq 7
@@ -50,7 +59,7 @@ status=0
 "$sandbox" --init /bin/false -- true 2>/dev/null || status=$?
 check "a failing --init gives 125" test "$status" -eq 125
 
-# 3. Signals and leftovers: the sandbox answers SIGTERM, and a daemon the command left
+# 4. Signals and leftovers: the sandbox answers SIGTERM, and a daemon the command left
 # behind dies with it.
 # A duration no other process on the host is likely to sleep for, to find the daemon by.
 duration="$((1000 + RANDOM)).$$"
@@ -69,14 +78,14 @@ check "SIGTERM to the sandbox ends the command (143)" test "$status" -eq 143
 sleep 0.2
 check "nothing is left behind" eval '! running'
 
-# 4. --keep keeps changes for the next run with the same directory, still not on the host.
+# 5. --keep keeps changes for the next run with the same directory, still not on the host.
 keep=$scratch/keep
 "$sandbox" --keep "$keep" -- sh -c "echo $token > $probe && echo $token > /volume1/probe"
 kept=$("$sandbox" --keep "$keep" -- sh -c "cat $probe /volume1/probe")
 check "--keep carries / and /volume1 over" test "$kept" = "$token"$'\n'"$token"
 check "--keep still leaves the host alone" test ! -e "$probe"
 
-# 5. --bind passes a host directory through, read-write.
+# 6. --bind passes a host directory through, read-write.
 mkdir "$scratch/shared"
 "$sandbox" --bind "$scratch/shared" -- sh -c "echo $token > $scratch/shared/out"
 check "--bind writes reach the host" test "$(cat "$scratch/shared/out" 2>/dev/null)" = "$token"

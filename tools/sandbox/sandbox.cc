@@ -168,8 +168,9 @@ const char kUsage[] =
     "  --init PROGRAM            run PROGRAM inside before COMMAND; its failure aborts\n"
     "\n"
     "The working directory and absolute path arguments on other filesystems are passed\n"
-    "through as well. COMMAND sees CORV_SANDBOX=1. Exit status: COMMAND's (128+N if it was\n"
-    "killed by signal N), 125 if the sandbox could not be set up.\n";
+    "through as well. COMMAND sees CORV_SANDBOX=1 and CORV_SANDBOX_VOLUMES (\"/volume1:BYTES\n"
+    "...\"). Exit status: COMMAND's (128+N if it was killed by signal N), 125 if the sandbox\n"
+    "could not be set up.\n";
 
 [[noreturn]] void usage_error(const std::string& what) {
     fprintf(stderr, "%s: %s (see %s --help)\n", kProgram, what.c_str(), kProgram);
@@ -657,6 +658,12 @@ class Sandbox {
         if (!options_.keep.empty())
             restore_volumes();
         setenv("CORV_SANDBOX", "1", 1);
+        // Tells what was asked for, so that tests can check it whatever the options were.
+        std::string volumes;
+        for (const auto& volume : options_.volumes)
+            volumes +=
+                (volumes.empty() ? "" : " ") + volume.path + ":" + std::to_string(volume.bytes);
+        setenv("CORV_SANDBOX_VOLUMES", volumes.c_str(), 1);
         if (!options_.init.empty()) {
             const int status = run_and_wait({options_.init}, original_mask_);
             if (!WIFEXITED(status) || WEXITSTATUS(status) != 0)

@@ -1,0 +1,30 @@
+#!/usr/bin/env bash
+# Installs the Debian 12 packages needed to build and test the project, only those missing.
+# Run as root.
+set -euo pipefail
+
+packages=(
+    cmake ninja-build g++ pkg-config
+    libjsoncpp-dev libcurl4-openssl-dev libssl-dev libboost-dev
+    libgtest-dev libbenchmark-dev
+    clang-format util-linux passwd ca-certificates
+)
+
+missing=()
+for package in "${packages[@]}"; do
+    status=$(dpkg-query -W -f='${db:Status-Status}' "$package" 2>/dev/null || true)
+    [[ $status == installed ]] || missing+=("$package")
+done
+
+if [[ ${#missing[@]} -eq 0 ]]; then
+    echo "setup-deps: all ${#packages[@]} packages present"
+    exit 0
+fi
+if [[ $(id -u) -ne 0 ]]; then
+    echo "setup-deps: missing ${missing[*]}; run as root to install them" >&2
+    exit 1
+fi
+echo "setup-deps: installing ${missing[*]}"
+export DEBIAN_FRONTEND=noninteractive
+apt-get update -q
+apt-get install -y -q --no-install-recommends "${missing[@]}"

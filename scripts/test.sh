@@ -1,0 +1,27 @@
+#!/usr/bin/env bash
+# Installs what is missing, builds, and runs the whole test suite. Run as root: the
+# integration tests run in corv-sandbox, which needs namespaces and mounts. The last line
+# printed is ctest's summary.
+set -euo pipefail
+cd "$(dirname "${BASH_SOURCE[0]}")/.."
+build=${CORV_BUILD_DIR:-build}
+
+bash scripts/setup-deps.sh
+bash scripts/build.sh
+bash scripts/check-sandbox.sh "$build/tools/sandbox/corv-sandbox"
+
+log=$(mktemp)
+trap 'rm -f "$log"' EXIT
+status=0
+# Two jobs for two cores; a sandboxed test case starts in a few tens of milliseconds.
+ctest --test-dir "$build" --output-on-failure -j2 --timeout 300 2>&1 | tee "$log" || status=$?
+
+# ctest closes with its timing and the list of failures; repeat its summary last.
+summary=$(grep -E '^[0-9]+% tests passed' "$log" | tail -n 1 || true)
+if [[ -z $summary ]]; then
+    echo "test.sh: ctest ran no test" >&2
+    exit 1
+fi
+echo
+echo "$summary"
+exit "$status"

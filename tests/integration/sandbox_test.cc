@@ -7,11 +7,14 @@
 #include <stdlib.h>
 #include <string.h>
 #include <sys/ioctl.h>
+#include <sys/prctl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/statfs.h>
 #include <sys/statvfs.h>
 #include <unistd.h>
+
+#include <linux/capability.h>
 
 #include <fstream>
 #include <set>
@@ -211,6 +214,15 @@ TEST_F(SandboxTest, SysIsReadOnly) {
     struct statvfs st;
     ASSERT_EQ(statvfs("/sys", &st), 0);
     EXPECT_TRUE(st.f_flag & ST_RDONLY);
+}
+
+TEST_F(SandboxTest, HostWideKnobsAreOutOfReach) {
+    struct statvfs st;
+    ASSERT_EQ(statvfs("/proc/sys", &st), 0);
+    EXPECT_TRUE(st.f_flag & ST_RDONLY);
+    for (int capability : {CAP_SYS_MODULE, CAP_SYS_TIME, CAP_SYS_BOOT})
+        EXPECT_EQ(prctl(PR_CAPBSET_READ, capability, 0, 0, 0), 0) << capability;
+    EXPECT_EQ(prctl(PR_CAPBSET_READ, CAP_SYS_ADMIN, 0, 0, 0), 1);
 }
 
 TEST_F(SandboxTest, DevIsMinimal) {

@@ -59,6 +59,8 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <linux/capability.h>
+
 #include <algorithm>
 #include <cstdint>
 #include <fstream>
@@ -655,6 +657,7 @@ class Sandbox {
         enter_namespaces();
         const std::string root = build_root();
         enter_root(root);
+        drop_host_wide_capabilities();
         if (!options_.keep.empty())
             restore_volumes();
         setenv("CORV_SANDBOX", "1", 1);
@@ -682,6 +685,29 @@ class Sandbox {
         if (WIFSIGNALED(status))
             return std::string("killed by ") + strsignal(WTERMSIG(status));
         return "exit status " + std::to_string(WEXITSTATUS(status));
+    }
+
+    // Most of /proc/sys and sysrq act on the host's kernel, not on the sandbox; nothing
+    // the engine does needs to change them.
+    static void protect_host_knobs(const std::string& root) {
+        for (const char* knob : {"/proc/sys", "/proc/sysrq-trigger"}) {
+            const std::string target = root + knob;
+            struct stat st;
+            if (lstat(target.c_str(), &st) != 0)
+                continue;  // a kernel built without it
+            do_mount(target, target, nullptr, MS_BIND | MS_REC, "", knob);
+            do_mount("", target, nullptr,
+                     MS_REMOUNT | MS_BIND | MS_RDONLY | MS_NOSUID | MS_NODEV | MS_NOEXEC, "",
+                     std::string(knob) + " read-only");
+        }
+    }
+
+    // Root in the sandbox is the host's root: the namespaces do not cover kernel modules,
+    // the clock or kexec, so what the sandbox runs may not use them.
+    static void drop_host_wide_capabilities() {
+        for (int capability : {CAP_SYS_MODULE, CAP_SYS_TIME, CAP_SYS_BOOT})
+            if (prctl(PR_CAPBSET_DROP, capability, 0, 0, 0) != 0)
+                fail_errno("cannot drop capability " + std::to_string(capability));
     }
 
     void enter_namespaces() {
@@ -756,6 +782,7 @@ class Sandbox {
         // This process is PID 1 of the new PID namespace, so the proc it mounts is that
         // namespace's.
         do_mount("proc", root + "/proc", "proc", MS_NOSUID | MS_NODEV | MS_NOEXEC, "", "proc");
+        protect_host_knobs(root);
         build_sys(root);
         for (const auto& volume : options_.volumes)
             mount_tmpfs(root + volume.path, "size=" + std::to_string(volume.bytes) + ",mode=0755");

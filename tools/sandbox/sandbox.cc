@@ -513,6 +513,16 @@ void mount_tmpfs(const std::string& target, const std::string& data, unsigned lo
     do_mount("tmpfs", target, "tmpfs", flags, data, "a tmpfs");
 }
 
+bool on_host_pty() {
+    for (int fd = 0; fd <= 2; ++fd) {
+        char name[PATH_MAX];
+        if (isatty(fd) && ttyname_r(fd, name, sizeof name) == 0 &&
+            strncmp(name, "/dev/pts/", 9) == 0)
+            return true;
+    }
+    return false;
+}
+
 // A /dev holding only what programs commonly expect. Device nodes are bound from the
 // host's /dev rather than created, which also works where mknod is not allowed.
 void build_dev(const std::string& root) {
@@ -525,8 +535,14 @@ void build_dev(const std::string& root) {
                  std::string("/dev/") + node);
     }
     make_dirs(dev + "/pts", 0755);
-    do_mount("devpts", dev + "/pts", "devpts", MS_NOSUID | MS_NOEXEC,
-             "newinstance,ptmxmode=0666,mode=0620", "devpts");
+    if (on_host_pty()) {
+        // Someone works in the sandbox from a terminal: show the host's terminals, so that
+        // the one in use has a name there too (tty, job control, pagers).
+        do_mount("/dev/pts", dev + "/pts", nullptr, MS_BIND | MS_REC, "", "/dev/pts");
+    } else {
+        do_mount("devpts", dev + "/pts", "devpts", MS_NOSUID | MS_NOEXEC,
+                 "newinstance,ptmxmode=0666,mode=0620", "devpts");
+    }
     mount_tmpfs(dev + "/shm", "mode=1777", MS_NOSUID | MS_NODEV);
     const std::pair<const char*, const char*> links[] = {{"pts/ptmx", "ptmx"},
                                                          {"/proc/self/fd", "fd"},

@@ -22,7 +22,7 @@ constexpr int kFlagBits = 0xF;
 constexpr const char kLockDir[] = "/tmp/lock";
 constexpr long kPollNanoseconds = 25 * 1000 * 1000;
 
-void pause() {
+void napBetweenTries() {
     struct timespec ts = {0, kPollNanoseconds};
     nanosleep(&ts, nullptr);  // an interruption only makes the next attempt earlier
 }
@@ -40,7 +40,7 @@ int retryUntil(int seconds, F&& attempt) {
         if (seconds <= 0 || Clock::now() >= deadline) {
             return 1;
         }
-        pause();
+        napBetweenTries();
     }
 }
 

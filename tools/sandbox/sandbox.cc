@@ -10,8 +10,15 @@
 //   * the root is an overlayfs whose lower layer is the host's root filesystem and whose
 //     upper layer lives on a private tmpfs (or in --keep DIR), so every change is
 //     copy-on-write and vanishes with the sandbox;
-//   * fresh tmpfs on /tmp and /run, fresh /proc, a minimal /dev, a read-only /sys;
-//   * size-limited tmpfs volumes (/volume1, 64 MiB, by default), so a full volume is real.
+//   * fresh tmpfs on /tmp and /run, fresh /proc (with /proc/sys read-only), a minimal /dev
+//     (the host's terminals only when run from one), a read-only /sys;
+//   * size-limited tmpfs volumes (/volume1, 64 MiB, by default), so a full volume is real;
+//     CORV_SANDBOX_VOLUMES tells the command which ("/volume1:67108864 ...");
+//   * no CAP_SYS_MODULE, CAP_SYS_TIME or CAP_SYS_BOOT, which no namespace confines.
+//
+// --keep DIR keeps the upper layer in DIR/upper (deletions show there as overlayfs
+// whiteouts) and the volumes' contents in DIR/volumes/, and a later run with the same DIR
+// starts from them; /tmp and /run start empty all the same, as after a reboot.
 //
 // Process layout. The process started by the caller (the supervisor) stays in the host's
 // namespaces; it forks the sandbox's PID 1, which builds the mounts, runs --init, runs the
@@ -40,6 +47,7 @@
 // sandbox itself could not be set up (usage, not root, no namespaces or overlayfs, a
 // failing --init); 126/127 when the command cannot be executed / is not found.
 
+#include <ctype.h>
 #include <errno.h>
 #include <fcntl.h>
 #include <limits.h>
@@ -127,13 +135,11 @@ class Fd {
             close(fd_);
         fd_ = -1;
     }
-    // A path that reaches what the descriptor refers to, even once it is hidden by a mount
-    // or lives outside the current root. /proc/1 because it is read by PID 1 and by the
-    // helpers PID 1 starts after the pivot, where /proc is the sandbox's own.
-    std::string proc_path(bool from_pid1_namespace) const {
-        return std::string(from_pid1_namespace ? "/proc/1/fd/" : "/proc/self/fd/") +
-               std::to_string(fd_);
-    }
+    // Paths that reach what the descriptor refers to even when a mount hides it or it lies
+    // outside the current root: for this process, and - once the sandbox's own /proc is in
+    // place - for any process of the sandbox, through PID 1's descriptor table.
+    std::string self_path() const { return "/proc/self/fd/" + std::to_string(fd_); }
+    std::string pid1_path() const { return "/proc/1/fd/" + std::to_string(fd_); }
 
   private:
     int fd_ = -1;
@@ -179,41 +185,24 @@ const char kUsage[] =
     exit(kSandboxFailed);
 }
 
-// "64M", "1G", "512K", "1048576" (bytes); binary units, an optional trailing "B"/"iB".
+// "64M", "1G", "512K", "1048576" (bytes); binary units, also written "MB" or "MiB".
 bool parse_size(const std::string& text, std::uint64_t* bytes) {
     size_t digits = 0;
-    while (digits < text.size() && isdigit(static_cast<unsigned char>(text[digits])))
+    while (digits < text.size() && text[digits] >= '0' && text[digits] <= '9')
         ++digits;
     if (digits == 0 || digits > 15)
         return false;
-    std::uint64_t value = std::stoull(text.substr(0, digits));
-    std::string unit = text.substr(digits);
-    if (unit.size() >= 2 && (unit.substr(unit.size() - 2) == "iB"))
-        unit.pop_back(), unit.pop_back();
-    else if (unit.size() == 2 && (unit.back() == 'B' || unit.back() == 'b'))
-        unit.pop_back();
+    const std::uint64_t value = std::stoull(text.substr(0, digits));
+    const std::string unit = text.substr(digits);
     int shift = 0;
-    if (unit.empty()) {
-        shift = 0;
-    } else if (unit.size() == 1) {
-        switch (toupper(static_cast<unsigned char>(unit[0]))) {
-            case 'K':
-                shift = 10;
-                break;
-            case 'M':
-                shift = 20;
-                break;
-            case 'G':
-                shift = 30;
-                break;
-            case 'T':
-                shift = 40;
-                break;
-            default:
-                return false;
-        }
-    } else {
-        return false;
+    if (!unit.empty()) {
+        const std::string units = "KMGT";
+        const auto index =
+            units.find(static_cast<char>(toupper(static_cast<unsigned char>(unit[0]))));
+        const std::string rest = unit.substr(1);
+        if (index == std::string::npos || !(rest.empty() || rest == "B" || rest == "iB"))
+            return false;
+        shift = 10 * static_cast<int>(index + 1);
     }
     if (value == 0 || value > (UINT64_MAX >> shift))
         return false;
@@ -407,12 +396,15 @@ class BindPlanner {
         if (resolved == "/" || in_tree(resolved, "/proc") || in_tree(resolved, "/sys") ||
             in_tree(resolved, "/dev"))
             return;
+        for (const auto& area : replaced_)
+            if (resolved == area)
+                return;  // the sandbox's own
         std::string anchor;
         for (const auto& point : mount_points_)
             if (point != "/" && in_tree(resolved, point) && point.size() > anchor.size())
                 anchor = point;
         for (const auto& area : replaced_) {
-            if (resolved == area || !in_tree(resolved, area))
+            if (!in_tree(resolved, area))
                 continue;
             const auto next = resolved.find('/', area.size() + 1);
             const std::string top = resolved.substr(0, next);
@@ -769,8 +761,8 @@ class Sandbox {
             keep_ = Fd(open(keep.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
             if (!keep_.valid())
                 fail_errno("cannot open " + keep);
-            upper = keep_.proc_path(false) + "/upper";
-            work = keep_.proc_path(false) + "/work";
+            upper = keep_.self_path() + "/upper";
+            work = keep_.self_path() + "/work";
         }
 
         do_mount("corv-sandbox", kScratch, "tmpfs", 0, "mode=0700", "the scratch tmpfs");
@@ -814,8 +806,7 @@ class Sandbox {
                 make_dirs(target.substr(0, target.find_last_of('/')), 0755);
                 make_file(target);
             }
-            do_mount(bind.source.proc_path(false), target, nullptr, MS_BIND | MS_REC, "",
-                     bind.path);
+            do_mount(bind.source.self_path(), target, nullptr, MS_BIND | MS_REC, "", bind.path);
         }
         binds_.clear();
         return root;
@@ -845,7 +836,7 @@ class Sandbox {
     // are tmpfs all the same, so their size limit holds.
     void restore_volumes() {
         for (const auto& volume : options_.volumes) {
-            const std::string saved = keep_.proc_path(true) + "/volumes" + volume.path;
+            const std::string saved = keep_.pid1_path() + "/volumes" + volume.path;
             if (access(saved.c_str(), F_OK) != 0)
                 continue;
             const int status =
@@ -857,7 +848,7 @@ class Sandbox {
 
     void save_volumes() {
         for (const auto& volume : options_.volumes) {
-            const std::string saved = keep_.proc_path(true) + "/volumes" + volume.path;
+            const std::string saved = keep_.pid1_path() + "/volumes" + volume.path;
             const std::string fresh = saved + ".new";
             if (run_and_wait({"rm", "-rf", fresh}, original_mask_) != 0 ||
                 run_and_wait({"cp", "-a", volume.path, fresh}, original_mask_) != 0) {

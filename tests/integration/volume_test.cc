@@ -147,6 +147,8 @@ TEST(Volumes, PackageTargets) {
 }
 
 TEST(Volumes, DefaultVolume) {
+    // A default volume must offer the root margin of 200 MiB.
+    ASSERT_EQ(mount("tmpfs", "/volume1", "tmpfs", MS_REMOUNT, "size=300m"), 0) << strerror(errno);
     EXPECT_TRUE(PMSSavePackageDefVolPath("/volume1"));
     std::string volume;
     EXPECT_TRUE(PMSGetPackageDefVol(volume));

@@ -294,7 +294,7 @@ TEST(InfoReader, LanguageVariants) {
 
 TEST(InfoReader, DependencyFileReplacesTheInfoKey) {
     TempDir dir;
-    writeFile(dir.path() + "/INFO", kBase +
+    writeFile(dir.path() + "/INFO", kFull +
                                         "install_dep_packages=\"a>=1:b\"\n"
                                         "install_conflict_packages=\"c\"\n");
     PackageInfo info;

@@ -68,7 +68,7 @@ TEST(Version, NamesAndOperators) {
 }
 
 TEST(Version, BadTextsNeverMatch) {
-    const char* bad[] = {"", "-", "--", "-1"};
+    const char* bad[] = {"", "-", "--", "---"};
     for (const char* text : bad) {
         PackageBasicInfo a("p", text);
         PackageBasicInfo b("p", "1.0");

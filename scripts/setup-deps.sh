@@ -8,6 +8,7 @@ packages=(
     libjsoncpp-dev libcurl4-openssl-dev libssl-dev libboost-dev
     libgtest-dev libbenchmark-dev
     clang-format util-linux passwd ca-certificates
+    procps # pgrep, for scripts/check-sandbox.sh
 )
 
 missing=()

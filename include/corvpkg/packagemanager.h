@@ -6,8 +6,10 @@
 
 #include <json/json.h>
 
+#include <map>
 #include <set>
 #include <string>
+#include <vector>
 
 #include "corvpkg/pkginfo.h"
 #include "corvpkg/pkgtypes.h"
@@ -16,6 +18,10 @@
 namespace CORVPackageTool {
 
 class PackageManagerPrivate;
+
+// A short word for a status of PackageManager::getPkgStatus ("running", "stopped",
+// "broken", ...), for people and scripts.
+CORVPKG_API const char* PMSPkgStatusWord(int status);
 
 class CORVPKG_API PackageManager {
   public:
@@ -65,6 +71,68 @@ class CORVPKG_API PackageManager {
     // A precheck before a package file is looked at: the file exists, there is room for it
     // where it must go, and a volume exists when the package needs one.
     bool CheckVolume(const char* cpkFile, const PackageInfo& info);
+
+    // Registration: moves INFO, scripts/, WIZARD_UIFILES/ and conf/ from the unpack
+    // directory `workDir` into /var/packages/<name>, flags it `installing`, links `target`
+    // to the payload directory and `etc` to the package's settings directory. True when all
+    // is in place; on false the registry stays flagged and the package shows as broken.
+    bool registerPackage(PKG_INSTALLATION_TYPE type, PackageInfo& info, const std::string& workDir,
+                         const std::string& target);
+    // The path of the package's control script with `info` read from the registry, or ""
+    // with the reason in the result: PKG_ERR_NOT_INSTALLED, PKG_ERR_BROKEN (no usable
+    // target, unreadable INFO, script not runnable) or PKG_ERR_NO_STATUS_SCRIPT.
+    std::string getServiceScript(const std::string& name, PackageInfo& info);
+    // Whether this OS lets the package run, by the maker's version limits. False with
+    // PKG_ERR_LIMIT_PROHIBITED, PKG_ERR_LIMIT_BLOCKED, PKG_ERR_BELOW_VERSION_LIMIT (with
+    // the parameters "oldver" and "curver") or PKG_ERR_LIMIT_OTHER.
+    bool CanPackageStartInThisFirmware(const PackageInfo& info);
+
+    // Listings of /var/packages, in directory order. Entries that are not directories, or
+    // whose INFO does not read, are passed over.
+    // Names of the packages on one of `volumes` (all when the set is empty; a package
+    // without target link is always listed).
+    std::vector<std::string> enumPackages(const std::set<std::string>& volumes,
+                                          unsigned long long mask);
+    std::vector<std::string> enumPackages(const char* volume, unsigned long long mask);
+    PackageBasicInfoMap enumPackageMap(unsigned long long mask);
+    void enumPackageInfoMap(std::map<std::string, PackageInfo>& out, const char* language,
+                            unsigned long long mask);
+    // Every package directory under `path` with an INFO: read ones into `out`, damaged ones
+    // by name into `failed`. False with PKG_ERR_ENUMERATION when any failed or the
+    // directory cannot be read.
+    bool enumPackageInfoByPath(const char* path, std::vector<PackageInfo>& out,
+                               std::vector<std::string>& failed, const char* language,
+                               unsigned long long mask);
+    bool enumPackageInfo(std::vector<PackageInfo>& out, const char* language,
+                         unsigned long long mask);
+
+    // Single packages.
+    bool getPackageInfoByPathAndInfoType(const char* dir, PackageInfo& info, const char* language,
+                                         unsigned long long mask);
+    bool getPackageInfoByPath(const char* dir, PackageInfo& info, const char* language);
+    bool getPackageInfoByPathAndName(const char* base, const std::string& name, PackageInfo& info,
+                                     const char* language, unsigned long long mask);
+    bool getInstallPackageInfo(const std::string& name, PackageInfo& info, const char* language,
+                               unsigned long long mask);
+    // Sets PKG_ERR_NOT_INSTALLED or PKG_OK.
+    bool getPackageInfo(const std::string& name, PackageInfo& info, const char* language,
+                        unsigned long long mask);
+    // One record per name, in order; true only if all were read.
+    bool getPackageInfo(std::vector<std::string>& names, std::vector<PackageInfo>& out,
+                        const char* language, unsigned long long mask);
+
+    // State. getServiceStatus answers whether the query worked; `running` is the answer,
+    // and a status script's exit value stays in the result.
+    bool getServiceStatus(const std::string& name, bool& running, bool askScript);
+    // 0 running, 1-3 stopped, 4 no status script, 150 broken, 255 not installed, 256-258
+    // stopped by the version limits, 259 a system error hid the status.
+    int getPkgStatus(const std::string& name);
+    // Bits: 1 installed, 2 running, 4 broken.
+    bool getPkgRoughStatus(const std::string& name, int& rough);
+    bool isStarted(const std::string& name);
+    // The package's own log, through its control script.
+    std::string getPackageLog(const std::string& name, bool quiet);
+    std::string getPackageLog(const std::string& name);
 
     std::string getFixedLogFilePath(const std::string& name);
     std::string getLogFilePath();

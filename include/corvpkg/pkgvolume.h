@@ -62,6 +62,10 @@ CORVPKG_API bool PMReadFile(const char* path, unsigned int limit, std::string& c
 CORVPKG_API bool PMSGetImageTmpPath(const char* category, const char* packageName,
                                     const char* version, std::string& path);
 
+// Whether a package is installed and usable: registry, INFO, a target directory on a
+// volume that has not failed.
+CORVPKG_API bool PMSCheckPackage(const std::string& name);
+
 // Volumes.
 CORVPKG_API bool PMSGetPackageDefVol(std::string& volume);
 CORVPKG_API bool PMSSavePackageDefVolPath(const char* path);

@@ -191,3 +191,27 @@ int VolumePathParseEx(const char* path, char* buffer) {
     snprintf(buffer, 4096, "%s", volume.c_str());
     return 0;
 }
+
+int FSInfoGet(const char* volume, CORVFSINFO** info) {
+    if (volume == nullptr || info == nullptr) {
+        VLIBCErrSet(ERR_BAD_PARAMETERS);
+        return -1;
+    }
+    *info = nullptr;
+    CORVMOUNTVOLINFO vol;
+    if (CORVMountVolInfoGet(volume, &vol) < 0) {
+        return 0;
+    }
+    auto* fs = static_cast<CORVFSINFO*>(calloc(1, sizeof(CORVFSINFO)));
+    if (fs == nullptr) {
+        VLIBCErrSet(ERR_OUT_OF_MEMORY);
+        return -1;
+    }
+    snprintf(fs->szMountPath, sizeof(fs->szMountPath), "%s", vol.szMountPath);
+    fs->state = vol.readOnly ? CORV_FS_STATE_CRASHED : 0;
+    fs->freeBytes = vol.freeBytes;
+    *info = fs;
+    return 1;
+}
+
+void FSInfoFree(CORVFSINFO* info) { free(info); }

@@ -4,6 +4,7 @@
 #include <map>
 #include <set>
 #include <string>
+#include <vector>
 
 #include "corvpkg/pkginfo.h"
 
@@ -62,6 +63,11 @@ bool PMSIsLegalName(const char* name, const char* forbidden);
 
 // Reads "major.minor-build" into `out`; numbers the text does not reach are 0.
 void PMSParseOSVersion(const char* text, int out[3]);
+
+// The wizard files that may describe an operation of `type`, relative to a package
+// directory, most specific first: "WIZARD_UIFILES/<base>_<lang>.sh", "<base>.sh",
+// "<base>_<lang>", "<base>". Without a language the two with one are left out.
+std::vector<std::string> PMSUIFileCandidates(const char* language, PKG_INSTALLATION_TYPE type);
 
 constexpr const char* kPackageNameForbidden = ":/<>=|";
 constexpr const char* kUIDirNameForbidden = ":/";

@@ -1,4 +1,6 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
-TEST(Sandbox, RunsAsRootInPrivateRoot) { EXPECT_EQ(getuid(), 0u); }
+TEST(Sandbox, RunsAsRootInPrivateRoot) {
+    EXPECT_EQ(getuid(), 0u);
+}

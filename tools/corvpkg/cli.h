@@ -69,5 +69,8 @@ class LogCapture {
 
 int cmdInfo(const std::vector<std::string>& args);
 int cmdSystem(const std::vector<std::string>& args);
+int cmdList(const std::vector<std::string>& args);
+int cmdStatus(const std::vector<std::string>& args);
+int cmdLog(const std::vector<std::string>& args);
 
 }  // namespace cli

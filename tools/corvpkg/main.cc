@@ -31,6 +31,28 @@ const std::vector<Command>& commands() {
          "  --size BYTES  size of the install to plan temporary space for\n"
          "  --json        print one JSON object\n",
          cmdSystem},
+        {"list", "list the installed packages with version, status and volume",
+         "usage: corvpkg list [--volume V] [--json] [--lang L]\n"
+         "\n"
+         "Lists the packages of /var/packages in directory order, each with its version,\n"
+         "its status (asked of its own status script) and the volume it lives on.\n"
+         "  --volume V  only the packages on volume V (for example /volume1)\n"
+         "  --json      print an array of objects\n",
+         cmdList},
+        {"status", "show the status of one installed package",
+         "usage: corvpkg status <name> [--json]\n"
+         "\n"
+         "Shows the package's status number and its meaning, and its rough status\n"
+         "(bits: 1 installed, 2 running, 4 broken).\n"
+         "Exit status: 0 running, 1 installed but not running, 2 broken, 3 not installed,\n"
+         "4 unknown (the status could not be found out).\n",
+         cmdStatus},
+        {"log", "print a package's own log, through its control script",
+         "usage: corvpkg log <name> [--json]\n"
+         "\n"
+         "Runs the package's start-stop-status script with the argument \"log\" and prints\n"
+         "what it prints. Exit status 1, with the reason, when that fails.\n",
+         cmdLog},
     };
     return table;
 }

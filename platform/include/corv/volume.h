@@ -48,3 +48,17 @@ int CORVShareTmpPathGet(const char* volumePath, char* buffer, int size);
 // The volume part of a path: "/volume12/@appstore/x" gives "/volume12". `buffer` must hold
 // 4096 bytes. 0, or -1 with ERR_BAD_PARAMETERS when the path is on no volume.
 int VolumePathParseEx(const char* path, char* buffer);
+
+// The state of the file system behind a volume.
+enum {
+    CORV_FS_STATE_CRASHED = 0x2,  // mounted read-only: the volume has failed
+};
+struct CORVFSINFO {
+    char szMountPath[4096];
+    int state;  // CORV_FS_STATE_* bits
+    unsigned long long freeBytes;
+};
+// The file system of the volume mounted at `volume`. 1 with `*info` allocated (free it with
+// FSInfoFree), 0 when no volume is mounted there, -1 on failure.
+int FSInfoGet(const char* volume, CORVFSINFO** info);
+void FSInfoFree(CORVFSINFO* info);

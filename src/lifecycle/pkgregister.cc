@@ -1,0 +1,193 @@
+// The package registry /var/packages/<name>: registration of an unpacked package, and the
+// gate to its control script.
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <string>
+
+#include "corv/log.h"
+#include "corv/process_runner.h"
+#include "corv/user.h"
+#include "corv/vlibc.h"
+#include "corv/volume.h"
+#include "corvpkg/packagemanager.h"
+#include "corvpkg/pkglog.h"
+#include "corvpkg/pkgtool.h"
+#include "corvpkg/pkgvolume.h"
+#include "corvpkg/privilege.h"
+#include "lifecycle/lifecycle_private.h"
+
+namespace CORVPackageTool {
+
+namespace {
+
+constexpr int kTargetLinkTries = 60;
+
+bool runLogged(const PackageInfo& info, PKG_INSTALLATION_TYPE type,
+               CORVUtils::ProcessRunner& runner) {
+    if (PMSRunAndWriteScriptLog(info, type, runner, -1) != 0) {
+        CORV_LOG_ERR("Failed to run %s", runner.toString().c_str());
+        return false;
+    }
+    return true;
+}
+
+}  // namespace
+
+std::string PMSRegistryDir(const std::string& name) {
+    return "/var/packages/" + name;
+}
+std::string PMSPackageEtcDir(const std::string& name) {
+    return "/usr/corv/etc/packages/" + name;
+}
+
+bool PMSCheckPayloadTarget(const std::string& registry) {
+    const std::string link = registry + "/target";
+    if (PMSReadLink(link).empty() || !VLIBCFileCheckDir(link.c_str())) {
+        return false;
+    }
+    const std::string volume = PMSGetPackageTargetVolByPath(registry.c_str());
+    if (volume == PKG_NOT_VOLUME_PATH) {
+        return true;
+    }
+    CORVFSINFO* fs = nullptr;
+    int n = FSInfoGet(volume.c_str(), &fs);
+    bool ok = n >= 1 && fs != nullptr && (fs->state & CORV_FS_STATE_CRASHED) == 0;
+    FSInfoFree(fs);
+    return ok;
+}
+
+bool PackageManager::registerPackage(PKG_INSTALLATION_TYPE type, PackageInfo& info,
+                                     const std::string& workDir, const std::string& target) {
+    const std::string registry = PMSRegistryDir(info.package);
+    // 1.
+    CORVUtils::ProcessRunner mkdirRegistry("/bin/mkdir", {"-p", registry});
+    CORVUtils::ProcessRunner mvInfo("/bin/mv", {"-f", workDir + "/INFO", registry + "/INFO"});
+    CORVUtils::ProcessRunner rmScripts("/bin/rm", {"-rf", registry + "/scripts"});
+    CORVUtils::ProcessRunner mvScripts("/bin/mv",
+                                       {"-f", workDir + "/scripts", registry + "/scripts"});
+    CORVUtils::ProcessRunner rmWizard("/bin/rm", {"-rf", registry + "/WIZARD_UIFILES"});
+    CORVUtils::ProcessRunner mvWizard(
+        "/bin/mv", {"-f", workDir + "/WIZARD_UIFILES", registry + "/WIZARD_UIFILES"});
+    CORVUtils::ProcessRunner rmConf("/bin/rm", {"-rf", registry + "/conf"});
+    CORVUtils::ProcessRunner mvConf("/bin/mv", {"-f", workDir + "/conf", registry + "/conf"});
+
+    // 2. Nothing has changed yet if the INFO is bad.
+    PackageInfo local;
+    bool ok = true;
+    bool outcome = false;
+    if (!PMSLoadPKGInfoFile(workDir, local, nullptr, PKG_INFO_MASK_ALL)) {
+        CORV_LOG_ERR("Failed to validate package INFO");
+        setResult(PKG_ERR_BAD_ARCHIVE);
+    } else {
+        // 3, 4. The flag goes in right after the directory, before anything can fail
+        // half-way, so that an interrupted registration always shows as broken.
+        ok &= runLogged(local, type, mkdirRegistry);
+        const std::string flag = registry + "/installing";
+        int fd = open(flag.c_str(), O_CREAT | O_TRUNC | O_WRONLY | O_CLOEXEC, 0644);
+        if (fd < 0) {
+            CORV_LOG_ERR("Failed to create install flag file %s", flag.c_str());
+        } else {
+            close(fd);
+        }
+        ok &= runLogged(local, type, mvInfo);
+        ok &= runLogged(local, type, rmScripts);
+        ok &= runLogged(local, type, mvScripts);
+        // 5.
+        if (VLIBCFileCheckDir((workDir + "/WIZARD_UIFILES").c_str())) {
+            PMSRunAndWriteScriptLog(local, type, rmWizard, -1);
+            ok &= runLogged(local, type, mvWizard);
+        }
+        // 6, 7.
+        bool confMoved = true;
+        if (VLIBCFileCheckDir((workDir + "/conf").c_str())) {
+            PMSRunAndWriteScriptLog(local, type, rmConf, -1);
+            confMoved = runLogged(local, type, mvConf);
+            ok &= confMoved;
+        }
+        if (ok && confMoved) {
+            const std::string link = registry + "/target";
+            bool linked = false;
+            for (int attempt = 1; attempt <= kTargetLinkTries && !linked; ++attempt) {
+                CORVUtils::ProcessRunner rmLink("/bin/rm", {"-rf", link});
+                PMSRunAndWriteScriptLog(local, type, rmLink, -1);
+                if (symlink(target.c_str(), link.c_str()) == 0) {
+                    linked = true;
+                } else {
+                    CORV_LOG_ERR("Failed to symlink %s, %m", link.c_str());
+                    if (attempt < kTargetLinkTries) {
+                        sleep(1);
+                    }
+                }
+            }
+            ok = linked;
+        }
+        // 8. Settings survive upgrades and normal uninstalls, so they live apart.
+        const std::string etcDir = PMSPackageEtcDir(local.package);
+        if (!VLIBCFileCheckDir(etcDir.c_str())) {
+            CORVFSMkdirP("/usr/corv/etc/packages", nullptr, 1, -1, -1, 0755);
+            if (mkdir(etcDir.c_str(), 0755) != 0) {
+                CORV_LOG_ERR("Failed to mkdir [%s], %m", etcDir.c_str());
+                ok = false;
+            }
+        }
+        const std::string user = PMSGetPkgUserName(local.package);
+        if (!user.empty()) {
+            uid_t uid = 0;
+            gid_t gid = 0;
+            if (CORVUserGetUGID(user.c_str(), &uid, &gid) < 0) {
+                CORV_LOG_ERR("Failed to get ID of %s [0x%04X %s:%d]", user.c_str(), VLIBCErrGet(),
+                             VLIBCErrorGetFile(), VLIBCErrorGetLine());
+            } else if (chown(etcDir.c_str(), uid, gid) != 0) {
+                CORV_LOG_ERR("Failed to chown %s (%m)", etcDir.c_str());
+            }
+        }
+        // 9.
+        if (ok) {
+            const std::string etcLink = registry + "/etc";
+            unlink(etcLink.c_str());
+            outcome = symlink(etcDir.c_str(), etcLink.c_str()) == 0;
+        }
+    }
+    // 10. The data must reach the disk even if the caller is killed right after.
+    pid_t child = VLIBCProcFork();
+    if (child == 0) {
+        sleep(1);
+        sync();
+        _exit(0);
+    }
+    return outcome;
+}
+
+std::string PackageManager::getServiceScript(const std::string& name, PackageInfo& info) {
+    const std::string registry = PMSRegistryDir(name);
+    // 1.
+    if (access(registry.c_str(), F_OK) != 0 || access((registry + "/INFO").c_str(), F_OK) != 0) {
+        setResult(PKG_ERR_NOT_INSTALLED);
+        return "";
+    }
+    // 2. The target is checked around the read, since a volume can fail in between.
+    if (!PMSCheckPayloadTarget(registry) ||
+        !PMSLoadPKGInfoFile(registry, info, nullptr, PKG_INFO_MASK_ALL) ||
+        !PMSCheckPayloadTarget(registry)) {
+        setResult(PKG_ERR_BROKEN);
+        return "";
+    }
+    // 3.
+    const std::string script = registry + "/scripts/start-stop-status";
+    if (access(script.c_str(), F_OK) != 0) {
+        setResult(PKG_ERR_NO_STATUS_SCRIPT);
+        return "";
+    }
+    // 4.
+    if (!PMSCheckIsExec(script)) {
+        CORV_LOG_ERR("%s can't run", script.c_str());
+        setResult(PKG_ERR_BROKEN);
+        return "";
+    }
+    // 5.
+    return script;
+}
+
+}  // namespace CORVPackageTool

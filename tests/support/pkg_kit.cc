@@ -1,0 +1,73 @@
+#include "support/pkg_kit.h"
+
+#include <stdlib.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include "support/files.h"
+
+namespace testutil {
+
+std::string statusScript(int statusExit, const std::string& logText) {
+    return "calls=\"/tmp/${CORVPKG_PKGNAME}.calls\"\n"
+           "case \"$1\" in\n"
+           "  start|stop) echo \"$1\" >> \"$calls\"; exit 0 ;;\n"
+           "  status) exit " +
+           std::to_string(statusExit) +
+           " ;;\n"
+           "  log) printf '%s\\n' '" +
+           logText +
+           "'; exit 0 ;;\n"
+           "esac\n"
+           "exit 1\n";
+}
+
+std::string infoOf(const TestPackage& pkg) {
+    std::string text = "package=\"" + pkg.name + "\"\nversion=\"" + pkg.version + "\"\n";
+    for (const auto& [key, value] : pkg.info) {
+        text += key + "=\"" + value + "\"\n";
+    }
+    return text;
+}
+
+static void writeParts(const std::string& dir, const TestPackage& pkg) {
+    writeFile(dir + "/INFO", infoOf(pkg));
+    for (const auto& [name, body] : pkg.scripts) {
+        const std::string path = dir + "/scripts/" + name;
+        writeFile(path, "#!/bin/sh\n" + body);
+        chmod(path.c_str(), 0755);
+    }
+    for (const auto& [name, content] : pkg.conf) {
+        writeFile(dir + "/conf/" + name, content);
+    }
+    for (const auto& [name, content] : pkg.wizard) {
+        writeFile(dir + "/WIZARD_UIFILES/" + name, content);
+    }
+}
+
+void writePackageDir(const std::string& dir, const TestPackage& pkg) {
+    writeParts(dir, pkg);
+    writeFile(dir + "/package/.keep", "");
+    for (const auto& [path, content] : pkg.payload) {
+        writeFile(dir + "/package/" + path, content);
+    }
+}
+
+void installFixture(const TestPackage& pkg, bool enabled, const std::string& volume) {
+    const std::string registry = "/var/packages/" + pkg.name;
+    const std::string target = volume + "/@appstore/" + pkg.name;
+    writeParts(registry, pkg);
+    writeFile(target + "/.keep", "");
+    for (const auto& [path, content] : pkg.payload) {
+        writeFile(target + "/" + path, content);
+    }
+    unlink((registry + "/target").c_str());
+    if (symlink(target.c_str(), (registry + "/target").c_str()) != 0) {
+        abort();
+    }
+    if (enabled) {
+        writeFile(registry + "/enabled", "");
+    }
+}
+
+}  // namespace testutil

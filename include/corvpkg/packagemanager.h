@@ -134,6 +134,47 @@ class CORVPKG_API PackageManager {
     std::string getPackageLog(const std::string& name, bool quiet);
     std::string getPackageLog(const std::string& name);
 
+    // Whether the package is meant to run: its `enabled` flag. False with PKG_ERR_SYSTEM
+    // (no name), PKG_ERR_NOT_INSTALLED or PKG_ERR_NOT_ENABLED.
+    bool isServiceEnabled(const char* name);
+    bool hasEnableConf(const std::string& registryDir, bool& unused);
+
+    // Dependency queries. Every order lists a package before what it depends on: a caller
+    // that starts packages walks it backwards, one that stops them forwards.
+    // True when `pkg` conflicts with an installed package, in either direction; `names`
+    // holds their display names.
+    bool arePackagesConflict(PackageBasicInfo pkg, const DepPkgVector& conflicts,
+                             std::string& names, const char* language);
+    // True when every dependency is installed in a fitting version and started; else
+    // `missing` has the absent ones in the JSON form and `notStarted` the display names.
+    bool arePackagesInstallAndStart(const DepPkgVector& deps, Json::Value& missing,
+                                    std::string& notStarted, const char* language);
+    // True when no installed package depends on `name`.
+    bool arePackagesDepended(std::string name, const char* language, std::string& names);
+    bool arePackagesDepended(std::string name, const char* language,
+                             std::vector<std::string>& names);
+    // True when every dependent of `name` is stopped.
+    bool areDependentPackageStop(std::string name, const char* language, std::string& names);
+    // The startable packages of `order` other than `name`, as {"name","id"} objects; true
+    // when there is none.
+    bool getDepPkgListStop(const std::vector<std::string>& order, std::string name,
+                           const char* language, Json::Value& list);
+    bool getDepPkgListStop(std::string name, const char* language, Json::Value& list);
+    // `pkgs` (all installed when null) ordered dependents first; false on a cycle.
+    bool topologicalSortPkgs(std::vector<PackageInfo>* pkgs, std::vector<std::string>& order);
+    bool getDependencyOrder(std::vector<std::string>& order);
+    // `name` and its active dependents (enabled, or started), dependents first.
+    bool getDependencyOrder(const char* name, std::vector<std::string>& order, bool useEnabledFlag);
+    // Whether installing `candidate` would close a dependency cycle.
+    bool hasCycle(const PackageInfo& candidate);
+    // `name` and its ancestors within `pkgs`, in install order reversed (dependents first).
+    bool getAncestryDependencyOrder(const char* name, std::vector<PackageInfo>& pkgs,
+                                    std::vector<std::string>& order);
+    // The enabled packages that require one of `services` to start.
+    void getDepServicePkgs(const std::set<std::string>& services, std::vector<PackageInfo>& pkgs);
+    void getDepServicePkgs(const std::vector<unsigned int>& services,
+                           std::vector<PackageInfo>& pkgs);
+
     std::string getFixedLogFilePath(const std::string& name);
     std::string getLogFilePath();
 

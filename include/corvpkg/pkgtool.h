@@ -52,6 +52,11 @@ CORVPKG_API int PMSParseDepJSON(const Json::Value& json, DepPkgVector& out);
 // The same from text: 0 for an empty text, -1 when it is not JSON.
 CORVPKG_API int PMSParseDepJSONString(const std::string& text, DepPkgVector& out);
 
+// The elements of a JSON array as text, joined by `separator`; false (and `out` untouched)
+// for anything but an array.
+CORVPKG_API bool joinJsonArray(const Json::Value& array, const std::string& separator,
+                               std::string& out);
+
 // The mask of an architecture token, exact and case-sensitive; 0 when unknown.
 CORVPKG_API int PMSMapSystemArch(const char* token);
 

@@ -28,13 +28,8 @@ std::vector<std::string> sorted(std::vector<std::string> v) {
     return v;
 }
 
-// A job for the package that the service manager can run: the package's own job adapter
-// comes with service integration; a plain one does for status.
 void runningJob(const std::string& name) {
-    testutil::writeFile("/etc/init/pkgctl-" + name + ".conf",
-                        "start on corv.pkgctl.pkgstart\nstop on corv.pkgctl.shutdown\n\n"
-                        "pre-start script\n\ttrue\nend script\n");
-    ASSERT_EQ(VLIBServiceStart(("pkgctl-" + name).c_str(), 0), 0);
+    ASSERT_TRUE(testutil::startPackageJob(name));
 }
 
 TestPackage withStatus(const std::string& name, int statusExit) {

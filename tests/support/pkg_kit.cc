@@ -4,6 +4,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include "corv/service.h"
 #include "support/files.h"
 
 namespace testutil {
@@ -68,6 +69,21 @@ void installFixture(const TestPackage& pkg, bool enabled, const std::string& vol
     if (enabled) {
         writeFile(registry + "/enabled", "");
     }
+}
+
+bool startPackageJob(const std::string& name) {
+    writeFile("/etc/init/pkgctl-" + name + ".conf",
+              "start on corv.pkgctl.pkgstart\nstop on corv.pkgctl.shutdown\n\n"
+              "pre-start script\n\ttrue\nend script\n");
+    return VLIBServiceStart(("pkgctl-" + name).c_str(), 0) == 0;
+}
+
+bool installRunning(TestPackage pkg, const std::string& volume) {
+    if (pkg.scripts.find("start-stop-status") == pkg.scripts.end()) {
+        pkg.scripts["start-stop-status"] = statusScript(0);
+    }
+    installFixture(pkg, true, volume);
+    return startPackageJob(pkg.name);
 }
 
 }  // namespace testutil

@@ -47,4 +47,12 @@ void writePackageDir(const std::string& dir, const TestPackage& pkg);
 void installFixture(const TestPackage& pkg, bool enabled = false,
                     const std::string& volume = "/volume1");
 
+// Gives an installed package a plain job "pkgctl-<name>" and starts it in the service
+// manager, so that its status can say "running". (The package's real job adapter comes
+// from service integration; status only needs the job to run.) False when it did not start.
+bool startPackageJob(const std::string& name);
+// An installed package that runs: fixture with `enabled`, a status script answering 0,
+// and its job started.
+bool installRunning(TestPackage pkg, const std::string& volume = "/volume1");
+
 }  // namespace testutil

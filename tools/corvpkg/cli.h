@@ -72,5 +72,8 @@ int cmdSystem(const std::vector<std::string>& args);
 int cmdList(const std::vector<std::string>& args);
 int cmdStatus(const std::vector<std::string>& args);
 int cmdLog(const std::vector<std::string>& args);
+int cmdVersionCompare(const std::vector<std::string>& args);
+int cmdDeps(const std::vector<std::string>& args);
+int cmdOrder(const std::vector<std::string>& args);
 
 }  // namespace cli

@@ -53,6 +53,28 @@ const std::vector<Command>& commands() {
          "Runs the package's start-stop-status script with the argument \"log\" and prints\n"
          "what it prints. Exit status 1, with the reason, when that fails.\n",
          cmdLog},
+        {"version-compare", "compare two versions as the engine does",
+         "usage: corvpkg version-compare <a> <op> <b>\n"
+         "\n"
+         "Compares version <a> with version <b>: op is one of = > < >= <= (or eq gt lt\n"
+         "ge le). Versions are compared number by number after bringing both to the same\n"
+         "count of dotted parts; \".\" and \"-\" delimit alike (1.2 = 1.2.0, 1.2-0045 = 1.2-45).\n"
+         "Exit status: 0 when the relation holds, 1 when it does not, 2 for a usage error.\n",
+         cmdVersionCompare},
+        {"deps", "show what a package needs, what needs it, and its stop order",
+         "usage: corvpkg deps <name> [--json] [--lang L]\n"
+         "\n"
+         "Shows the installed package's dependencies with their bounds, the installed\n"
+         "packages that depend on it, and the order in which it and its running dependents\n"
+         "are stopped (dependents first).\n"
+         "Exit status: 1 when the package is not installed or the dependencies form a cycle.\n",
+         cmdDeps},
+        {"order", "show the install order of everything installed",
+         "usage: corvpkg order [--json]\n"
+         "\n"
+         "Prints every installed package, each after the packages it depends on.\n"
+         "Exit status: 1 with PKG_ERR_DEPENDENCY_CYCLE when the dependencies form a cycle.\n",
+         cmdOrder},
     };
     return table;
 }

@@ -175,6 +175,29 @@ class CORVPKG_API PackageManager {
     void getDepServicePkgs(const std::vector<unsigned int>& services,
                            std::vector<PackageInfo>& pkgs);
 
+    // Package files. The record of a .cpk's INFO, conf and scripts, read from single
+    // members in a temporary folder that is removed again. `type` plays no part.
+    bool queryPackageFileInfo(const std::string& cpkFile, PackageInfo& info,
+                              PKG_INSTALLATION_TYPE type, const char* language);
+    // Whether the payload package.tgz has the MD5 `checksum`; a null checksum is not
+    // checked.
+    bool verifyPackageTgzFile(const std::string& cpkFile, const char* checksum);
+    // The signature check by the administrator's trust level: PKG_SIGNATURE_OK when the
+    // package may go on, else the reason.
+    static PKG_ERRCODE verifyPackageSignature(const char* path);
+
+    // Installability. Each stops at the first failure with the result set.
+    bool checkPkgInfoCanInstallEx(PackageInfo& info, const char* language);
+    // The same, with the OS range reported as PKG_ERR_OS_VERSION.
+    bool checkPkgInfoCanInstall(PackageInfo& info, const char* language);
+    // -1 not comparable (not installed), 0 same version, 1 `info` is newer, 2 older.
+    int compareWithInstallPkgInfo(const PackageInfo& info);
+    bool canPackageRunAfterInstall(const PackageInfo& info);
+    // The services of a mask (0x08 ssh, 0x10 pgsql) that are not up; 0 when all are.
+    unsigned int checkServiceStarted(unsigned int mask);
+    // The services of `services` that are not enabled, by display name.
+    std::set<std::string> checkServiceStarted(std::set<std::string> services);
+
     std::string getFixedLogFilePath(const std::string& name);
     std::string getLogFilePath();
 

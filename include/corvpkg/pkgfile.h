@@ -3,6 +3,7 @@
 
 #include <string>
 
+#include "corvpkg/pkginfo.h"
 #include "corvpkg/visibility.h"
 
 namespace CORVPackageTool {
@@ -18,5 +19,14 @@ CORVPKG_API extern const PKG_SCRIPT_ENTRY g_PackageScripts[PKG_SCRIPT_COUNT];
 // Which control scripts exist in `scriptsDir`; existing scripts without the owner's
 // execute bit are made runnable (0700) on the way.
 CORVPKG_API unsigned int PMGetScriptMask(const std::string& scriptsDir);
+
+// Extracts INFO, conf/ and the control scripts of `cpkFile` into `dir` (single members
+// through /bin/tar) and reads them into `info`. False only when INFO cannot be extracted;
+// an INFO that does not read still gives true, with `info` as the reader left it.
+bool PMSExtractPackageInfo(const std::string& dir, const std::string& cpkFile, PackageInfo& info,
+                           const char* language);
+// Whether the MD5 of the file, as /usr/bin/openssl prints it (lower-case hex), is
+// exactly `expected`.
+CORVPKG_API bool PMSCompareCheckSum(const char* path, const char* expected);
 
 }  // namespace CORVPackageTool

@@ -1,6 +1,7 @@
 // Whether a package may run on this OS at all, by the maker's version limits.
 #include <string>
 
+#include "corv/service.h"
 #include "corvpkg/packagemanager.h"
 #include "corvpkg/pkglimit.h"
 
@@ -26,6 +27,39 @@ bool PackageManager::CanPackageStartInThisFirmware(const PackageInfo& info) {
             setResult(PKG_ERR_LIMIT_OTHER);
             return false;
     }
+}
+
+}  // namespace CORVPackageTool
+
+namespace CORVPackageTool {
+
+unsigned int PackageManager::checkServiceStarted(unsigned int mask) {
+    if (mask == 0) {
+        return 0;
+    }
+    if ((mask & 0x08) && VLIBServiceIsEnabled("ssh-shell") != 0) {
+        mask &= ~0x08u;
+    }
+    if ((mask & 0x10) && VLIBServiceIsRunning("pgsql") == 1) {
+        mask &= ~0x10u;
+    }
+    return mask;
+}
+
+std::set<std::string> PackageManager::checkServiceStarted(std::set<std::string> services) {
+    std::set<std::string> off;
+    for (const std::string& service : services) {
+        if (VLIBServiceIsEnabled(service.c_str()) != 0) {
+            continue;
+        }
+        char display[0x200] = "";
+        if (VLIBServicecfgDisplayNameGet(service.c_str(), display, sizeof(display)) < 0) {
+            off.insert(service);
+        } else {
+            off.insert(display);
+        }
+    }
+    return off;
 }
 
 }  // namespace CORVPackageTool

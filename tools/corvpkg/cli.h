@@ -75,5 +75,8 @@ int cmdLog(const std::vector<std::string>& args);
 int cmdVersionCompare(const std::vector<std::string>& args);
 int cmdDeps(const std::vector<std::string>& args);
 int cmdOrder(const std::vector<std::string>& args);
+int cmdBuild(const std::vector<std::string>& args);
+int cmdInspect(const std::vector<std::string>& args);
+int cmdCheck(const std::vector<std::string>& args);
 
 }  // namespace cli

@@ -75,6 +75,32 @@ const std::vector<Command>& commands() {
          "Prints every installed package, each after the packages it depends on.\n"
          "Exit status: 1 with PKG_ERR_DEPENDENCY_CYCLE when the dependencies form a cycle.\n",
          cmdOrder},
+        {"build", "make a package file from a package source directory",
+         "usage: corvpkg build <source-dir> [-o file.cpk] [--sign KEY] [--json]\n"
+         "\n"
+         "Packs <source-dir>/package/ into package.tgz, writes its MD5 into the INFO's\n"
+         "checksum, and writes an uncompressed .cpk with INFO, package.tgz and, when\n"
+         "present, scripts/, conf/, WIZARD_UIFILES/, LICENSE and the icons. The source's\n"
+         "INFO must read as the engine reads it (package, version, maintainer, description).\n"
+         "  -o FILE     the package file (default <package>-<version>.cpk)\n"
+         "  --sign KEY  sign with the platform's signature tool, KEY from the caller's keyring\n",
+         cmdBuild},
+        {"inspect", "show a package file's record, scripts, checksum and signature",
+         "usage: corvpkg inspect <file.cpk> [--json] [--lang L]\n"
+         "\n"
+         "Reads INFO, conf/ and the scripts from the file (single members, nothing is\n"
+         "installed), checks the payload against its checksum and asks the signature tool\n"
+         "for its verdict under the configured trust level.\n",
+         cmdInspect},
+        {"check", "tell whether a package file can be installed here, and why not",
+         "usage: corvpkg check <file.cpk> [--json] [--lang L]\n"
+         "\n"
+         "Runs the installability checks in their fixed order (record, volume, checksum,\n"
+         "OS range, conflicts, services, dependencies, platform, port, upgradability,\n"
+         "signature) and prints \"installable\" or the report: a message key of the\n"
+         "desktop and the texts for its placeholders.\n"
+         "Exit status: 0 installable, 1 not installable, 2 usage error.\n",
+         cmdCheck},
     };
     return table;
 }

@@ -1,0 +1,30 @@
+// The system web server and the ports of the machine, as the reference platform sees them.
+#pragma once
+
+namespace WebUtils {
+// Whether any TCP port from `from` to `to` (inclusive) is taken: a socket of this machine
+// listens on it, or an installed package declared it as its admin port. `protocol`
+// ("http", "https", ...) is carried over TCP in every case.
+bool IsPortConflict(const char* protocol, int from, int to);
+}  // namespace WebUtils
+
+namespace corvw3 {
+
+// The system's own web server. Its ports come from /etc/corvinfo.conf keys "http_port"
+// and "https_port", 5000 and 5001 when those are not set.
+class Engine {
+  public:
+    Engine();
+};
+
+class NOS {
+  public:
+    explicit NOS(Engine* engine);
+    int GetHttpPort() const;
+    int GetHttpsPort() const;
+
+  private:
+    Engine* engine_;
+};
+
+}  // namespace corvw3

@@ -1,0 +1,267 @@
+// The installability check of a package file, and its report for the user.
+#include <stdio.h>
+#include <unistd.h>
+
+#include <string>
+
+#include "corv/log.h"
+#include "corv/vlibc.h"
+#include "corvpkg/packagemanager.h"
+#include "corvpkg/pkgtool.h"
+#include "corvpkg/pkgverify.h"
+#include "corvpkg/pkgvolume.h"
+
+namespace CORVPackageTool {
+
+namespace {
+
+constexpr int kPgsqlVolumeKinds = 0x41;
+
+std::string osVersionText(const int v[3]) {
+    char buf[32];
+    snprintf(buf, sizeof(buf), "%d.%d-%04d", v[0], v[1], v[2]);
+    return buf;
+}
+
+PKG_ERRCODE volumeError(int platformError) {
+    switch (platformError) {
+        case PKG_VOLERR_NO_USB_VOLUME:
+            return PKG_ERR_NO_USB_VOLUME;
+        case PKG_VOLERR_NO_VOLUME:
+            return PKG_ERR_NO_VOLUME;
+        case PKG_VOLERR_NO_SPACE:
+            return PKG_ERR_NO_SPACE;
+        default:
+            return PKG_ERR_SYSTEM;
+    }
+}
+
+// The steps in their fixed order; `code` says which refused.
+bool checkFile(const char* language, const char* cpkFile, PKG_ERRCODE& code, Json::Value& data,
+               PackageInfo& info) {
+    PackageManager pm;
+    // 1.
+    if (language == nullptr) {
+        code = PKG_ERR_SYSTEM;
+        return false;
+    }
+    // 2. A record that the caller filled is taken as it is.
+    if (info.package.empty() &&
+        !pm.queryPackageFileInfo(cpkFile, info, static_cast<PKG_INSTALLATION_TYPE>(0), language)) {
+        code = PKG_ERR_BROKEN;
+        return false;
+    }
+    // 3.
+    if (!pm.CheckVolume(cpkFile, info)) {
+        code = volumeError(VLIBCErrGet());
+        return false;
+    }
+    // 4.
+    if (!info.checksum.empty() && !pm.verifyPackageTgzFile(cpkFile, info.checksum.c_str())) {
+        code = PKG_ERR_BAD_ARCHIVE;
+        return false;
+    }
+    // 5.
+    switch (PMSComparePackageAndOSVersion(info)) {
+        case 1:
+            code = PKG_ERR_OS_TOO_NEW;
+            return false;
+        case -1:
+            code = PKG_ERR_OS_TOO_OLD;
+            return false;
+        default:
+            break;
+    }
+    // 6.
+    std::string names;
+    if (pm.arePackagesConflict(PackageBasicInfo(info.package, info.version), info.conflict_packages,
+                               names, language) &&
+        !names.empty()) {
+        data["instPackageList"] = names;
+        code = PKG_ERR_CONFLICT_PACKAGES;
+        return false;
+    }
+    // 7.
+    std::set<std::string> off = pm.checkServiceStarted(PMSGetInstallDepServiceSet(info));
+    if (!off.empty()) {
+        if (off.count("pgsql") && VolumeCountGet(kPgsqlVolumeKinds) == 0) {
+            code = PKG_ERR_VOLUME_NOT_READY;
+            return false;
+        }
+        const std::string texts =
+            std::string("/usr/corv/corvman/webui/texts/") + language + "/strings";
+        if (access(texts.c_str(), F_OK) != 0 &&
+            access("/usr/corv/corvman/webui/texts/enu/strings", F_OK) != 0) {
+            // Without the desktop's texts there is nobody to tell: the check ends here.
+            return false;
+        }
+        Json::Value list(Json::arrayValue);
+        for (const std::string& name : off) {
+            list.append(name);
+        }
+        data["serviceNoStarted"] = list;
+        code = PKG_ERR_SERVICE_NOT_STARTED;
+        return false;
+    }
+    // 8.
+    Json::Value missing;
+    std::string notStarted;
+    if (!pm.arePackagesInstallAndStart(info.dep_packages, missing, notStarted, language)) {
+        data["packages"] = missing;
+        data["unStartPkgList"] = notStarted;
+        code = PKG_ERR_DEPENDENCY;
+        return false;
+    }
+    // 9.
+    if (!PMSCheckPackageArchModelMatched(info)) {
+        code = PKG_ERR_PLATFORM;
+        return false;
+    }
+    // 10.
+    if (PMSCheckPackagePortConflict(info)) {
+        code = PKG_ERR_PORT_CONFLICT;
+        return false;
+    }
+    // 11. A package without upgrade scripts cannot replace an installed copy of itself.
+    if (PMSCheckPackage(info.package) && (info.script_mask & (0x20 | 0x40)) == 0) {
+        code = PKG_ERR_UPGRADE_FAILED;
+        return false;
+    }
+    // 12.
+    PKG_ERRCODE signature = PackageManager::verifyPackageSignature(cpkFile);
+    if (signature == PKG_SIGNATURE_OK) {
+        return true;
+    }
+    code = (signature >= PKG_ERR_NOT_MAKER_SIGNED && signature <= PKG_ERR_SIGNATURE_BAD)
+               ? signature
+               : PKG_ERR_SYSTEM;
+    return false;
+}
+
+Json::Value memberNames(const Json::Value& object) {
+    Json::Value names(Json::arrayValue);
+    if (object.isObject()) {
+        for (const std::string& name : object.getMemberNames()) {
+            names.append(name);
+        }
+    }
+    return names;
+}
+
+}  // namespace
+
+bool CheckPackageFileInfoImpl(const char* language, const char* cpkFile, std::string& displayName,
+                              PKG_ERRCODE& code, Json::Value& data, PackageInfo& info) {
+    code = PKG_OK;
+    data = Json::Value(Json::objectValue);
+    bool ok = checkFile(language, cpkFile, code, data, info);
+    displayName = info.displayname;
+    return ok;
+}
+
+bool CheckPackageFileInfo(const char* language, const char* cpkFile, std::string& displayName,
+                          Json::Value& report) {
+    report = Json::Value(Json::arrayValue);
+    PackageInfo info;
+    PKG_ERRCODE code = PKG_OK;
+    Json::Value data;
+    if (CheckPackageFileInfoImpl(language, cpkFile, displayName, code, data, info)) {
+        return true;
+    }
+    auto add = [&](const std::string& text) { report.append(text); };
+    switch (code) {
+        case PKG_ERR_BROKEN:
+            add("pkgmgr:pkgmgr_file_not_package");
+            break;
+        case PKG_ERR_SERVICE_NOT_STARTED: {
+            bool ssh = false;
+            for (const Json::Value& name : data["serviceNoStarted"]) {
+                ssh = ssh || name.asString() == "ssh-shell";
+            }
+            if (ssh) {
+                add("tree:require_sshd");
+            } else {
+                add("pkgmgr:require_service");
+                add(data["serviceNoStarted"][0].asString());
+            }
+            break;
+        }
+        case PKG_ERR_BAD_ARCHIVE:
+        case PKG_ERR_SIGNATURE_BAD:
+            add("pkgmgr:broken_package");
+            break;
+        case PKG_ERR_DEPENDENCY: {
+            std::string names;
+            joinJsonArray(memberNames(data["packages"]), ", ", names);
+            const std::string unstarted = data["unStartPkgList"].asString();
+            if (names.empty() && !unstarted.empty()) {
+                add("pkgmgr:depend_unstart");
+                add(unstarted);
+            } else if (!names.empty() && !unstarted.empty()) {
+                add("pkgmgr:depend_uninst_unstart");
+                add(names);
+                add(unstarted);
+            } else {
+                add("pkgmgr:depend_packages");
+                add(names);
+            }
+            break;
+        }
+        case PKG_ERR_UPGRADE_FAILED:
+            add("pkgmgr:pkgmgr_pkg_cannot_upgrade");
+            break;
+        case PKG_ERR_NO_SPACE:
+            add("pkgmgr:error_sys_no_space");
+            break;
+        case PKG_ERR_PLATFORM: {
+            char product[256] = "";
+            if (VLIBCFileGetKeyValue(VLIBC_INFO_DEFAULTS_PATH, "product", product, sizeof(product),
+                                     0) <= 0) {
+                CORV_LOG_ERR("Failed to get product");
+                break;
+            }
+            add("pkgmgr:pkgmgr_pkg_not_support_platform");
+            add(product);
+            break;
+        }
+        case PKG_ERR_PORT_CONFLICT:
+            add("pkgmgr:port_conflict");
+            add(std::to_string(info.adminport));
+            break;
+        case PKG_ERR_CONFLICT_PACKAGES:
+            add("pkgmgr:conflict_packages");
+            add(data["instPackageList"].asString());
+            break;
+        case PKG_ERR_VOLUME_NOT_READY:
+        case PKG_ERR_NO_VOLUME:
+            add("pkgmgr:pkgmgr_space_not_ready");
+            break;
+        case PKG_ERR_NOT_MAKER_SIGNED:
+            add("pkgmgr:pkgmgr_not_corv_publish");
+            break;
+        case PKG_ERR_UNKNOWN_PUBLISHER:
+            add("pkgmgr:pkgmgr_unknown_publisher");
+            break;
+        case PKG_ERR_NO_SIGNATURE:
+            add("pkgmgr:pkgmgr_no_signature");
+            break;
+        case PKG_ERR_CERT_EXPIRED:
+            add("pkgmgr:pkgmgr_cert_expired");
+            break;
+        // The upper limit is shown in both cases, also where the lower one failed.
+        case PKG_ERR_OS_TOO_NEW:
+            add("pkgmgr:pkgmgr_pkg_required_older_version");
+            add(osVersionText(PMSGetOSMaxVer(info)));
+            break;
+        case PKG_ERR_OS_TOO_OLD:
+            add("pkgmgr:pkgmgr_pkg_required_newer_version");
+            add(osVersionText(PMSGetOSMaxVer(info)));
+            break;
+        default:
+            add("error:error_error_system");
+            break;
+    }
+    return false;
+}
+
+}  // namespace CORVPackageTool

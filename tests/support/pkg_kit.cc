@@ -1,10 +1,12 @@
 #include "support/pkg_kit.h"
 
+#include <stdio.h>
 #include <stdlib.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include "corv/service.h"
+#include "corvpkg/pkgbuild.h"
 #include "support/files.h"
 
 namespace testutil {
@@ -69,6 +71,19 @@ void installFixture(const TestPackage& pkg, bool enabled, const std::string& vol
     if (enabled) {
         writeFile(registry + "/enabled", "");
     }
+}
+
+std::string buildPackage(const TestPackage& pkg) {
+    const std::string source = "/tmp/kit-src/" + pkg.name;
+    removeAll(source);
+    writePackageDir(source, pkg);
+    const std::string file = "/tmp/" + pkg.name + "-" + pkg.version + ".cpk";
+    std::string error;
+    if (!CORVPackageTool::PMSBuildPackageFile(source, file, "", error)) {
+        fprintf(stderr, "test setup: cannot build %s: %s\n", pkg.name.c_str(), error.c_str());
+        abort();
+    }
+    return file;
 }
 
 bool startPackageJob(const std::string& name) {

@@ -47,6 +47,11 @@ void writePackageDir(const std::string& dir, const TestPackage& pkg);
 void installFixture(const TestPackage& pkg, bool enabled = false,
                     const std::string& volume = "/volume1");
 
+// Builds a package file from `pkg` with the package builder: the source goes to
+// /tmp/kit-src/<name>, the file to /tmp/<name>-<version>.cpk, whose path is returned.
+// Aborts the test program when the build fails.
+std::string buildPackage(const TestPackage& pkg);
+
 // Gives an installed package a plain job "pkgctl-<name>" and starts it in the service
 // manager, so that its status can say "running". (The package's real job adapter comes
 // from service integration; status only needs the job to run.) False when it did not start.

@@ -9,6 +9,7 @@ packages=(
     libgtest-dev libbenchmark-dev
     clang-format util-linux passwd ca-certificates
     procps # pgrep, for scripts/check-sandbox.sh
+    postgresql nginx-light cron # the daemons of the reference platform's system services
 )
 
 missing=()

@@ -42,6 +42,11 @@ bool parseJson(const std::string& text, Json::Value* value, std::string* reason)
     return reader->parse(text.data(), text.data() + text.size(), value, reason);
 }
 
+// The member `key` of an object, or null.
+const Json::Value* member(const Json::Value& value, const char* key) {
+    return value.isObject() && value.isMember(key) ? &value[key] : nullptr;
+}
+
 bool stringArray(const Json::Value& value, std::vector<std::string>* out) {
     if (!value.isArray()) {
         return false;
@@ -69,22 +74,21 @@ int readServiceFile(const std::string& path, ServiceFile* service, std::string* 
         VLIBCErrSet(ERR_MALFORMED);
         return -1;
     }
-    const Json::Value* map = root.isObject() ? root.find("init_job_map", nullptr) : nullptr;
-    const Json::Value* jobs =
-        map != nullptr && map->isObject() ? map->find("upstart", nullptr) : nullptr;
+    const Json::Value* map = member(root, "init_job_map");
+    const Json::Value* jobs = map != nullptr ? member(*map, "upstart") : nullptr;
     if (jobs == nullptr || !stringArray(*jobs, &service->jobs) || service->jobs.empty()) {
         *reason = "\"init_job_map\" must be an object with an \"upstart\" array of job names";
         VLIBCErrSet(ERR_MALFORMED);
         return -1;
     }
-    if (const Json::Value* required = root.find("required_corvservice", nullptr)) {
+    if (const Json::Value* required = member(root, "required_corvservice")) {
         if (!stringArray(*required, &service->required)) {
             *reason = "\"required_corvservice\" must be an array of service names";
             VLIBCErrSet(ERR_MALFORMED);
             return -1;
         }
     }
-    if (const Json::Value* display = root.find("display_name", nullptr)) {
+    if (const Json::Value* display = member(root, "display_name")) {
         if (!display->isString()) {
             *reason = "\"display_name\" must be a string";
             VLIBCErrSet(ERR_MALFORMED);

@@ -8,17 +8,6 @@ bash scripts/setup-deps.sh
 bash scripts/build.sh
 
 build=${CORV_BUILD_DIR:-build}
-sandbox=$build/tools/sandbox/corv-sandbox
-corvpkg=$build/tools/corvpkg/corvpkg
-
-step() {
-    printf '\n==== %s\n' "$1"
-    shift
-    printf '$ %s\n' "$*"
-    "$sandbox" --init tools/platform/corv-platform-setup -- "$@"
-}
-
-step "Version of the command line" "$corvpkg" --version
-step "What the example package declares" "$corvpkg" info examples/hello
-step "The same, as JSON" "$corvpkg" info examples/hello --json
-printf '\n==== Demo finished\n'
+# One sandbox for all steps, so that each step sees what the previous ones left.
+exec "$build/tools/sandbox/corv-sandbox" --init tools/platform/corv-platform-setup -- \
+    /bin/bash scripts/demo-steps.sh "$PWD/$build/tools/corvpkg/corvpkg"

@@ -52,7 +52,9 @@ void printText(const PackageInfo& info, const Json::Value& json) {
     line("exclude_arch:", joined(info.exclude_arch_list));
     line("model:", joined(info.model_list));
     line("os_min_ver:", json["os_min_ver"].asString());
-    line("os_max_ver:", json["os_max_ver"].asString());
+    if (json["os_max_ver"].asString() != "0.0-0") {
+        line("os_max_ver:", json["os_max_ver"].asString());
+    }
     line("depends:", deps(info.dep_packages));
     line("conflicts:", deps(info.conflict_packages));
     if (info.adminport != 0 || !info.adminurl.empty()) {

@@ -34,19 +34,37 @@ using CORV::PkgUtils::WorkerResp;
 
 int g_made = 0;
 
+// Closes the call log whichever way a write ends.
+class Fd {
+  public:
+    explicit Fd(int fd) : fd_(fd) {}
+    ~Fd() {
+        if (fd_ >= 0) {
+            close(fd_);
+        }
+    }
+    Fd(const Fd&) = delete;
+    Fd& operator=(const Fd&) = delete;
+    int get() const { return fd_; }
+
+  private:
+    int fd_;
+};
+
 void record(const std::string& line) {
     const char* path = getenv("CORV_TEST_PLUGIN_LOG");
     if (path == nullptr || *path == '\0') {
         return;
     }
-    int fd = open(path, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
-    if (fd < 0) {
+    Fd fd(open(path, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644));
+    if (fd.get() < 0) {
         return;
     }
-    std::string text = line + "\n";
-    ssize_t written = write(fd, text.data(), text.size());
-    (void)written;  // a lost line shows up as a failed expectation in the test
-    close(fd);
+    // One write per line, so that lines of several workers never interleave; a lost line
+    // shows up as a failed expectation in the test.
+    const std::string text = line + "\n";
+    ssize_t written = write(fd.get(), text.data(), text.size());
+    (void)written;
 }
 
 class ScriptedWorker : public CORV::PkgUtils::IWorker {

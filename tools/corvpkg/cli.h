@@ -78,5 +78,6 @@ int cmdOrder(const std::vector<std::string>& args);
 int cmdBuild(const std::vector<std::string>& args);
 int cmdInspect(const std::vector<std::string>& args);
 int cmdCheck(const std::vector<std::string>& args);
+int cmdResource(const std::vector<std::string>& args);
 
 }  // namespace cli

@@ -101,6 +101,19 @@ const std::vector<Command>& commands() {
          "desktop and the texts for its placeholders.\n"
          "Exit status: 0 installable, 1 not installable, 2 usage error.\n",
          cmdCheck},
+        {"resource", "show a package's resources: request, own-file, workers by phase",
+         "usage: corvpkg resource <name> [--json]\n"
+         "\n"
+         "Shows the installed package's conf/resource as its workers see it when no wizard\n"
+         "answers are given (placeholders that stay unresolved are dropped), its\n"
+         "conf/resource.own (what the workers recorded), and for each phase the workers\n"
+         "that would run, in running order: an acquire phase runs the workers of the ids\n"
+         "that the request asks for, a release phase (in reverse) those that the own-file\n"
+         "holds.\n"
+         "  --json     print one JSON object\n"
+         "Exit status: 1 when the package is not installed, one of its files is unreadable,\n"
+         "or the plug-in providers can't be read.\n",
+         cmdResource},
     };
     return table;
 }

@@ -66,6 +66,18 @@ bool parseCommon(const std::vector<std::string>& args, const Command& command, C
     return true;
 }
 
+int parseSingle(const std::vector<std::string>& args, const char* command, const char* what,
+                CommonOptions& out, const std::vector<OptionSpec>& extra) {
+    const Command& self = findCommand(command);
+    if (!parseCommon(args, self, out, extra)) {
+        return EXIT_USAGE;
+    }
+    if (out.positional.size() != 1) {
+        return usageError(self, std::string("give exactly one ") + what);
+    }
+    return -1;
+}
+
 int printFailure(bool json, int code, const std::string& reason, const Json::Value& data) {
     const CORVPackageTool::PKG_ERRCODE_INFO* info = CORVPackageTool::PMSGetErrCodeInfo(code);
     const char* name = info ? info->name : "PKG_ERR_UNKNOWN";

@@ -46,6 +46,11 @@ struct CommonOptions {
 bool parseCommon(const std::vector<std::string>& args, const Command& command, CommonOptions& out,
                  const std::vector<OptionSpec>& extra = {});
 
+// parseCommon for a command that takes exactly one positional argument; `what` names it
+// in the usage error ("package name"). -1 when all is well, else the exit status to return.
+int parseSingle(const std::vector<std::string>& args, const char* command, const char* what,
+                CommonOptions& out, const std::vector<OptionSpec>& extra = {});
+
 // Prints a failure as "error: <CODE_NAME> (<code>): <reason>", or with --json as
 // {"success":false,"code":N,"name":"...","reason":"...","data":...}. Returns EXIT_FAILED.
 int printFailure(bool json, int code, const std::string& reason,

@@ -66,13 +66,9 @@ int cmdVersionCompare(const std::vector<std::string>& args) {
 }
 
 int cmdDeps(const std::vector<std::string>& args) {
-    const Command& self = findCommand("deps");
     CommonOptions opts;
-    if (!parseCommon(args, self, opts)) {
-        return EXIT_USAGE;
-    }
-    if (opts.positional.size() != 1) {
-        return usageError(self, "give exactly one package name");
+    if (int status = parseSingle(args, "deps", "package name", opts); status >= 0) {
+        return status;
     }
     const std::string& name = opts.positional[0];
     PackageManager pm;

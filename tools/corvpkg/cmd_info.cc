@@ -73,15 +73,9 @@ void printText(const PackageInfo& info, const Json::Value& json) {
 }  // namespace
 
 int cmdInfo(const std::vector<std::string>& args) {
-    const Command& self = *std::find_if(commands().begin(), commands().end(), [](const Command& c) {
-        return std::string(c.name) == "info";
-    });
     CommonOptions opts;
-    if (!parseCommon(args, self, opts)) {
-        return EXIT_USAGE;
-    }
-    if (opts.positional.size() != 1) {
-        return usageError(self, "give exactly one package directory");
+    if (int status = parseSingle(args, "info", "package directory", opts); status >= 0) {
+        return status;
     }
     const std::string& dir = opts.positional[0];
     struct stat st {};

@@ -34,13 +34,11 @@ Json::Value scriptNames(unsigned int mask) {
 }  // namespace
 
 int cmdBuild(const std::vector<std::string>& args) {
-    const Command& self = findCommand("build");
     CommonOptions opts;
-    if (!parseCommon(args, self, opts, {{"-o", true}, {"--sign", true}})) {
-        return EXIT_USAGE;
-    }
-    if (opts.positional.size() != 1) {
-        return usageError(self, "give exactly one package source directory");
+    if (int status = parseSingle(args, "build", "package source directory", opts,
+                                 {{"-o", true}, {"--sign", true}});
+        status >= 0) {
+        return status;
     }
     const std::string& source = opts.positional[0];
     std::string output = opts.has("-o") ? opts.options["-o"] : "";
@@ -71,13 +69,9 @@ int cmdBuild(const std::vector<std::string>& args) {
 }
 
 int cmdInspect(const std::vector<std::string>& args) {
-    const Command& self = findCommand("inspect");
     CommonOptions opts;
-    if (!parseCommon(args, self, opts)) {
-        return EXIT_USAGE;
-    }
-    if (opts.positional.size() != 1) {
-        return usageError(self, "give exactly one package file");
+    if (int status = parseSingle(args, "inspect", "package file", opts); status >= 0) {
+        return status;
     }
     const std::string& file = opts.positional[0];
     if (!isFile(file)) {
@@ -115,13 +109,9 @@ int cmdInspect(const std::vector<std::string>& args) {
 }
 
 int cmdCheck(const std::vector<std::string>& args) {
-    const Command& self = findCommand("check");
     CommonOptions opts;
-    if (!parseCommon(args, self, opts)) {
-        return EXIT_USAGE;
-    }
-    if (opts.positional.size() != 1) {
-        return usageError(self, "give exactly one package file");
+    if (int status = parseSingle(args, "check", "package file", opts); status >= 0) {
+        return status;
     }
     const std::string& file = opts.positional[0];
     if (!isFile(file)) {

@@ -60,13 +60,9 @@ int cmdList(const std::vector<std::string>& args) {
 }
 
 int cmdStatus(const std::vector<std::string>& args) {
-    const Command& self = findCommand("status");
     CommonOptions opts;
-    if (!parseCommon(args, self, opts)) {
-        return EXIT_USAGE;
-    }
-    if (opts.positional.size() != 1) {
-        return usageError(self, "give exactly one package name");
+    if (int status = parseSingle(args, "status", "package name", opts); status >= 0) {
+        return status;
     }
     const std::string& name = opts.positional[0];
     PackageManager pm;
@@ -105,13 +101,9 @@ int cmdStatus(const std::vector<std::string>& args) {
 }
 
 int cmdLog(const std::vector<std::string>& args) {
-    const Command& self = findCommand("log");
     CommonOptions opts;
-    if (!parseCommon(args, self, opts)) {
-        return EXIT_USAGE;
-    }
-    if (opts.positional.size() != 1) {
-        return usageError(self, "give exactly one package name");
+    if (int status = parseSingle(args, "log", "package name", opts); status >= 0) {
+        return status;
     }
     PackageManager pm;
     LogCapture log;

@@ -120,13 +120,9 @@ void printText(const Json::Value& report) {
 }  // namespace
 
 int cmdResource(const std::vector<std::string>& args) {
-    const Command& self = findCommand("resource");
     CommonOptions opts;
-    if (!parseCommon(args, self, opts)) {
-        return EXIT_USAGE;
-    }
-    if (opts.positional.size() != 1) {
-        return usageError(self, "give exactly one package name");
+    if (int status = parseSingle(args, "resource", "package name", opts); status >= 0) {
+        return status;
     }
     const std::string& name = opts.positional[0];
     if (!isPackageName(name) || VLIBCFileExist(("/var/packages/" + name + "/INFO").c_str()) != 1) {

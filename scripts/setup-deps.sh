@@ -10,6 +10,7 @@ packages=(
     clang-format util-linux passwd ca-certificates
     procps # pgrep, for scripts/check-sandbox.sh
     postgresql nginx-light cron # the daemons of the reference platform's system services
+    libgpgme-dev gnupg # corv-codesign, the reference platform's package signature tool
 )
 
 missing=()

@@ -9,6 +9,7 @@
 
 #include "common/vlibc_holders.h"
 #include "corv/log.h"
+#include "corv/service.h"
 #include "corv/vlibc.h"
 #include "corvpkg/json_util.h"
 #include "corvpkg/pkgtool.h"

@@ -10,6 +10,7 @@
 #include <string>
 #include <vector>
 
+#include "corv/service.h"
 #include "corv/vlibc.h"
 #include "support/files.h"
 

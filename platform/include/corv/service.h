@@ -22,6 +22,7 @@
 #include "corv/vlibc.h"
 
 #define VLIB_INIT_JOB_DIR "/etc/init"
+#define VLIB_SERVICE_CFG_DIR "/usr/corv/etc/corvservice.d"
 #define VLIB_SERVICE_STATE_DIR "/run/corv/service"
 
 // Job and service states of VLIBServiceStatusGet.

@@ -230,10 +230,3 @@ int VLIBCProcAlive(pid_t pid);  // 1 when the process exists
 // Whether the machine is a small-box model whose only volume is /volume1.
 // The reference platform answers from key "dockette" ("yes") of the defaults file.
 int VLIBCIsDockette();
-
-// ---------------------------------------------------------------------------------------
-// Service manager (its job and configuration side grows with the service issues).
-// The system's service names: the `<name>.cfg` files of /usr/corv/etc/corvservice.d,
-// appended to `*list`. Count, or -1.
-#define VLIB_SERVICE_CFG_DIR "/usr/corv/etc/corvservice.d"
-int VLIBServiceEnum(PVLIBSZLIST* list);

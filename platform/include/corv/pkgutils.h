@@ -15,6 +15,7 @@
 #pragma once
 
 #include <json/json.h>
+#include <sys/types.h>
 
 #include <string>
 #include <utility>
@@ -139,6 +140,13 @@ bool IsLegalRelPath(const std::string& root, const std::string& relative);
 // package's `target`). On failure `out` is unchanged and the error is that of
 // IsLegalRelPath, or 0x0700 when the file does not exist.
 bool ResolveRelPath(const std::string& root, const std::string& relative, std::string& out);
+
+// Copies `source` to `destination` with `mode`, through a temporary name beside the
+// destination and one rename, so a reader never sees half a file. An existing destination
+// is refused with 0x0800 unless `replace`. Other failures: 0x0D00 (empty argument), 0x0900
+// (source unreadable), 0x0C00 (temporary file), 0x0B00 (write), 0x2800 (rename).
+bool InstallConfigFile(const std::string& source, const std::string& destination, mode_t mode,
+                       bool replace);
 
 }  // namespace PkgUtils
 }  // namespace CORV

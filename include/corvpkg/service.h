@@ -92,4 +92,12 @@ CORVPKG_API bool LoadExtraEnv(const std::string& name, PKG_INSTALLATION_TYPE* ty
 CORVPKG_API std::string ExtraEnvPath(const std::string& name);
 
 }  // namespace Service
+
+namespace Resource {
+// Publishes the package's jobs, job adapter and service file again from its stored
+// "service-cfg" request (an empty one when there is none), keeping files that are still
+// valid, and records the jobs in the own-file.
+CORVPKG_API bool RestoreServiceCfg(const std::string& pkg);
+}  // namespace Resource
+
 }  // namespace CORVPackageTool

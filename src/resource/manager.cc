@@ -12,6 +12,7 @@
 #include "corvpkg/resource.h"
 #include "corvpkg/worker.h"
 #include "resource/resource_private.h"
+#include "resource/workers/builtin_workers.h"
 
 namespace CORVPackageTool {
 namespace Resource {
@@ -49,8 +50,11 @@ namespace Resource {
 //   "selfcheck"           0x0012  SelfCheck
 //   "certificate-config"  0x0012  CertConfig
 //
-// None of these classes exists yet, so the table holds only its end.
+// Only the classes that exist have their rows; the others join at their place.
 const BuiltinWorker g_BuiltinWorkers[] = {
+    {"service-cfg", 0x0012, NewServiceCfg},
+    {"crontab-job", 0x0044, NewCrontabJob},
+    {"corvcrond", 0x0044, NewCorvCrond},
     {nullptr, 0, nullptr},
 };
 

@@ -1,0 +1,14 @@
+// Factories of the workers compiled into the library, for the rows of g_BuiltinWorkers.
+#pragma once
+
+#include "corv/pkgutils.h"
+
+namespace CORVPackageTool {
+namespace Resource {
+
+CORV::PkgUtils::IWorker* NewServiceCfg();
+CORV::PkgUtils::IWorker* NewCrontabJob();
+CORV::PkgUtils::IWorker* NewCorvCrond();
+
+}  // namespace Resource
+}  // namespace CORVPackageTool

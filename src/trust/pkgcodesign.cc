@@ -9,6 +9,7 @@
 
 #include "corv/codesign.h"
 #include "corv/log.h"
+#include "corv/process_runner.h"
 #include "corv/vlibc.h"
 #include "corvpkg/packagemanager.h"
 
@@ -53,15 +54,20 @@ PKG_ERRCODE PackageManager::verifyPackageSignature(const char* path) {
             return PKG_ERR_SIGNATURE_SYSTEM;
         }
     }
-    // 5.
-    std::vector<const char*> argv;
-    for (const char* const* part = CORVCodesignCommand(); *part != nullptr; ++part) {
-        argv.push_back(*part);
+    // 5. The tool's words are kept from the caller's output, which may be a protocol of
+    // its own (JSON for scripts); only the exit status is the answer.
+    const char* const* command = CORVCodesignCommand();
+    CORVUtils::ProcessRunner tool(command[0]);
+    for (const char* const* part = command + 1; *part != nullptr; ++part) {
+        tool.addArguments(*part);
     }
-    argv.push_back("--verify");
-    argv.push_back(absolute);
-    argv.push_back(nullptr);
-    switch (VLIBCExecv(argv[0], argv.data(), 1)) {
+    tool.addArguments("--verify", absolute);
+    int status = tool.run(true, true);
+    if (status > 5 || status < 0) {
+        CORV_LOG_ERR("%s: %d %s", tool.toString().c_str(), status,
+                     tool.getCapturedOutputErr().c_str());
+    }
+    switch (status) {
         case 0:
             return PKG_SIGNATURE_OK;
         case 1:

@@ -1,0 +1,26 @@
+// Firewall reloads of the reference platform: recorded, never applied to the host.
+#include "corv/firewall.h"
+
+#include <stdio.h>
+#include <time.h>
+
+#include "corv/log.h"
+#include "corv/vlibc.h"
+
+int CORVFwRuleHup() {
+    if (CORVFSMkdirP("/run/corvfw", nullptr, 1, -1, -1, 0755) != 0) {
+        return -1;
+    }
+    FILE* out = fopen("/run/corvfw/reloads", "a");
+    if (out == nullptr) {
+        CORV_LOG_ERR("Failed to open /run/corvfw/reloads (%m)");
+        VLIBCErrSet(ERR_WRITE_FAILED);
+        return -1;
+    }
+    const bool ok = fprintf(out, "%lld reload\n", static_cast<long long>(time(nullptr))) > 0;
+    if (fclose(out) != 0 || !ok) {
+        VLIBCErrSet(ERR_WRITE_FAILED);
+        return -1;
+    }
+    return 0;
+}

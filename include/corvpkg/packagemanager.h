@@ -63,6 +63,19 @@ class CORVPKG_API PackageManager {
     void insertJsonParam(std::string key, const Json::Value& value);
     Json::Value getJsonParam(std::string key);
 
+    // Related-service restarts. The OR of the start/stop restart masks of this manager's
+    // package and of every package of `names` but the last (the last is the package
+    // itself, whose mask is already the start).
+    unsigned long long findRestartServices(const std::vector<std::string>& names);
+    // Reloads the daemons of `mask`, or, with mask 0, of this manager's package for `type`
+    // (start/stop masks for start and stop, else install/uninstall). Type 0 does nothing.
+    // The result of RestartServicesAction; 0 for type 0.
+    int RestartServices(PKG_INSTALLATION_TYPE type, unsigned long long mask);
+    // Gives up the package lock and reloads every daemon of `mask`, the firewall last and
+    // only when all else reloaded. 1 on success; else 0 with PKG_ERR_RESTART_SERVICES and
+    // the names that failed in the parameter "services".
+    int RestartServicesAction(unsigned long mask);
+
     // The volume for a package's files: "/volume1" on a small-box model, the system
     // install path for a package of install_type "system", else the volume of `volume`;
     // it must have `size` plus the margin free. False with the reason in the platform error.

@@ -4,9 +4,11 @@
 #include <string>
 
 #include "corv/vlibc.h"
+#include "corvpkg/json_util.h"
 #include "corvpkg/pkgtool.h"
 #include "corvpkg/resource.h"
 #include "corvpkg/service.h"
+#include "corvpkg/worker.h"
 #include "support/files.h"
 #include "support/pkg_kit.h"
 
@@ -22,6 +24,14 @@ void InstallCtl() {
         ASSERT_EQ(VLIBCExecl("/bin/mkdir", 0xbb, "-p", "/usr/corv/sbin", nullptr), 0);
         ASSERT_EQ(VLIBCExecl("/bin/cp", 0xbb, CORVPKGCTL_PATH, kCtl, nullptr), 0);
     }
+}
+
+// The scripted test plug-in as the worker "boot" of the start and halt phases.
+void RegisterBootWorker() {
+    testutil::writeFile(std::string(Resource::kProviderDir) + "/p",
+                        std::string(R"({"workers":[{"id":"boot","interval":"0x0088","major":1,)") +
+                            R"("minor":0,"path":")" + CORVPKG_TEST_PLUGIN_PATH + "\"}]}");
+    testutil::writeFile(std::string(Resource::kProviderDir) + "/global", R"({"providers":["p"]})");
 }
 
 PackageInfo Installed(const testutil::TestPackage& pkg) {
@@ -70,4 +80,23 @@ TEST(ServiceIntegrationCtl, FailingScriptFailsTheStart) {
     EXPECT_EQ(VLIBCExecl(kCtl, 0xbb, "setup", "demo", nullptr), 0);
     EXPECT_EQ(VLIBCExecl(kCtl, 0xbb, "swap-on", nullptr), 0);
     EXPECT_NE(VLIBCExecl(kCtl, 0xbb, "start", "absent", nullptr), 0);
+}
+
+TEST(ServiceIntegrationCtl, FailingWorkersLeaveTheirMessages) {
+    InstallCtl();
+    RegisterBootWorker();
+    testutil::TestPackage demo("demo");
+    demo.conf["resource"] = R"({"boot":{"tag":"b","fail":["acquire"],"message":"pkgmgr:boom"}})";
+    demo.scripts["start-stop-status"] = testutil::statusScript(0);
+    Installed(demo);
+    EXPECT_NE(VLIBCExecl(kCtl, 0xbb, "start", "demo", nullptr), 0);
+    EXPECT_TRUE(testutil::exists("/tmp/workermsg-acquire-demo"));
+    EXPECT_FALSE(testutil::exists("/tmp/demo.calls")) << "no start after a failed worker";
+
+    testutil::writeFile("/var/packages/demo/conf/resource",
+                        R"({"boot":{"tag":"b","fail":["release"]}})");
+    EXPECT_EQ(VLIBCExecl(kCtl, 0xbb, "start", "demo", nullptr), 0);
+    EXPECT_NE(VLIBCExecl(kCtl, 0xbb, "stop", "demo", nullptr), 0);
+    EXPECT_TRUE(testutil::exists("/tmp/workermsg-release-demo"));
+    EXPECT_EQ(testutil::readFile("/tmp/demo.calls"), "start\nstop\n");
 }

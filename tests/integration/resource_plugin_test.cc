@@ -70,9 +70,15 @@ std::string calls() {
     return out;
 }
 
-std::string describe(const std::vector<std::shared_ptr<WorkerProxy>>& list) {
+// The workers of a list. The library's own ("NOS") come first; they are left out unless
+// `withBuiltins`, so that a test of plug-ins does not change with the library's table.
+std::string describe(const std::vector<std::shared_ptr<WorkerProxy>>& list,
+                     bool withBuiltins = false) {
     std::string out;
     for (const auto& proxy : list) {
+        if (!withBuiltins && proxy->GetProvider() == "NOS") {
+            continue;
+        }
         char interval[16];
         snprintf(interval, sizeof(interval), "%02X", proxy->GetInterval());
         out += (out.empty() ? "" : " ") + proxy->GetResourceID() + "/" + interval + "/" +
@@ -158,6 +164,8 @@ TEST_F(PluginWorker, PhaseListsTakePluginsInOrderWithTheLaterProviderInTheEarlie
     std::vector<std::shared_ptr<WorkerProxy>> list;
     ASSERT_TRUE(FindRunnableWorkers(TIMING_POSTINST, list));
     EXPECT_EQ(describe(list), "x/12/p2 y/22/p1 z/12/p2");
+    ASSERT_FALSE(list.empty());
+    EXPECT_EQ(list.front()->GetProvider(), "NOS") << "the library's own workers run first";
     ASSERT_TRUE(FindRunnableWorkers(TIMING_DISABLE, list));
     EXPECT_EQ(describe(list), "x/44/p2");
     ASSERT_TRUE(FindRunnableWorkers(TIMING_PREINST, list));
@@ -176,8 +184,9 @@ TEST_F(PluginWorker, OnlyInterfaceVersionOneZeroAndUsableObjectsLoad) {
     std::vector<std::shared_ptr<WorkerProxy>> list;
     ASSERT_TRUE(FindRunnableWorkers(TIMING_POSTINST, list));
     EXPECT_EQ(describe(list), "good/12/p");
-    ASSERT_EQ(list.size(), 1u);
-    EXPECT_TRUE(list[0]->CreateInstance());
+    ASSERT_FALSE(list.empty());
+    EXPECT_EQ(list.back()->GetResourceID(), "good");
+    EXPECT_TRUE(list.back()->CreateInstance());
 }
 
 TEST_F(PluginWorker, OneWorkerForAnIdIsTheLatestRegistrationInAnyPhase) {
@@ -243,7 +252,7 @@ TEST_F(PluginWorker, ABuiltinIdIsNeverTakenOverWhileItsRowIsInTheList) {
     for (const auto& phase : kPhases) {
         std::vector<std::shared_ptr<WorkerProxy>> list;
         ASSERT_TRUE(FindRunnableWorkersIn(source, phase.timing, list));
-        EXPECT_EQ(describe(list), phase.expected) << TimingWord(phase.timing);
+        EXPECT_EQ(describe(list, true), phase.expected) << TimingWord(phase.timing);
     }
     std::unique_ptr<WorkerProxy> one(FindRunnableWorkerIn(source, "port"));
     ASSERT_TRUE(one);

@@ -84,5 +84,6 @@ int cmdBuild(const std::vector<std::string>& args);
 int cmdInspect(const std::vector<std::string>& args);
 int cmdCheck(const std::vector<std::string>& args);
 int cmdResource(const std::vector<std::string>& args);
+int cmdJobs(const std::vector<std::string>& args);
 
 }  // namespace cli

@@ -17,8 +17,6 @@
 
 namespace cli {
 
-int cmdJobs(const std::vector<std::string>& args);
-
 namespace {
 
 using namespace CORVPackageTool;

@@ -114,6 +114,13 @@ const std::vector<Command>& commands() {
          "Exit status: 1 when the package is not installed, one of its files is unreadable,\n"
          "or the plug-in providers can't be read.\n",
          cmdResource},
+        {"jobs", "show a package's generated init job and service configuration, and their state",
+         "usage: corvpkg jobs <name> [--json]\n"
+         "\n"
+         "Prints /etc/init/pkgctl-<name>.conf and its service configuration, what the init\n"
+         "system says of the job, whether it runs, whether the service is enabled, and the\n"
+         "package's own jobs.\n",
+         cmdJobs},
     };
     return table;
 }

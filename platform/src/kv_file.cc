@@ -15,6 +15,7 @@
 
 #include "corv/log.h"
 #include "corv/vlibc.h"
+#include "io_util.h"
 
 namespace {
 
@@ -192,20 +193,7 @@ bool readWhole(const char* path, std::string& text, bool* missing = nullptr) {
     return true;
 }
 
-bool writeAll(int fd, const char* data, size_t size) {
-    while (size > 0) {
-        ssize_t n = write(fd, data, size);
-        if (n < 0 && errno == EINTR) {
-            continue;
-        }
-        if (n <= 0) {
-            return false;
-        }
-        data += n;
-        size -= static_cast<size_t>(n);
-    }
-    return true;
-}
+using corvplat::writeAll;
 
 // Replaces `path` by `content`: written beside it and renamed over it, so that a reader
 // sees the old file or the new one and never a part. A symbolic link is kept: its

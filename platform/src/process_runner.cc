@@ -1,5 +1,6 @@
 // Runs one program with arguments, environment and identity; captures what it writes.
 #include "corv/process_runner.h"
+#include "io_util.h"
 
 #include <errno.h>
 #include <fcntl.h>
@@ -90,20 +91,7 @@ pid_t waitBlocking(pid_t pid, int* status) {
     return rc;
 }
 
-bool writeAll(int fd, const char* data, size_t size) {
-    while (size > 0) {
-        ssize_t n = write(fd, data, size);
-        if (n < 0 && errno == EINTR) {
-            continue;
-        }
-        if (n <= 0) {
-            return false;
-        }
-        data += n;
-        size -= static_cast<size_t>(n);
-    }
-    return true;
-}
+using corvplat::writeAll;
 
 // NAME=value strings: the caller's environment with the added entries on top.
 std::vector<std::string> childEnvironment(

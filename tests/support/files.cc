@@ -13,6 +13,11 @@ namespace testutil {
 void writeFile(const std::string& path, const std::string& content) {
     std::error_code ec;
     std::filesystem::create_directories(std::filesystem::path(path).parent_path(), ec);
+    // A link is replaced, never written through: the platform links tools such as
+    // /usr/corv/sbin/corvpkgctl into the build tree, which a sandbox may share read-write.
+    if (std::filesystem::is_symlink(std::filesystem::symlink_status(path, ec))) {
+        std::filesystem::remove(path, ec);
+    }
     std::ofstream out(path, std::ios::binary | std::ios::trunc);
     out << content;
     if (!out) {

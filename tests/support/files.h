@@ -7,8 +7,9 @@
 
 namespace testutil {
 
-// Writes `content` to `path`, creating the parent directories. Aborts the test program
-// when the file cannot be written: every later assertion would be meaningless.
+// Writes `content` to `path`, creating the parent directories; a symbolic link at `path`
+// is replaced by the file, not written through. Aborts the test program when the file
+// cannot be written: every later assertion would be meaningless.
 void writeFile(const std::string& path, const std::string& content);
 std::string readFile(const std::string& path);
 bool exists(const std::string& path);

@@ -137,10 +137,17 @@ TEST(CliPackage, ListAndStatusOfInstalledPackages) {
     ASSERT_TRUE(CORVPackageTool::fromString(list.out, rows)) << list.out;
     ASSERT_EQ(rows.size(), 2u);
     for (const Json::Value& row : rows) {
+        ASSERT_NE(row["package"].asString(), "half");
         EXPECT_EQ(row["volume"].asString(), "/volume1");
         EXPECT_EQ(row["status_word"].asString(),
                   row["package"].asString() == "up" ? "running" : "stopped");
     }
+    TestPackage half = source("half");
+    testutil::installFixture(half);
+    testutil::writeFile("/var/packages/half/installing", "");
+    auto broken = run(kCli, {"status", "half"});
+    EXPECT_EQ(broken.status, 2) << "an interrupted install is broken";
+    EXPECT_NE(broken.out.find("broken"), std::string::npos) << broken.out;
     EXPECT_EQ(run(kCli, {"status", "up"}).status, 0);
     EXPECT_EQ(run(kCli, {"status", "down"}).status, 1);
     EXPECT_EQ(run(kCli, {"status", "absent"}).status, 3);

@@ -2,11 +2,13 @@
 // sandbox.
 #include <sys/mount.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <chrono>
 #include <string>
 
 #include "corv/service.h"
@@ -264,4 +266,31 @@ TEST(Registry, HangingStatusScriptIsBounded) {
     PackageManager pm;
     // The bound is a minute; the caller gets a clear answer instead of waiting forever.
     EXPECT_EQ(pm.getPkgStatus("hang"), 259);
+}
+
+TEST(Registry, TargetLinkThatAppearsOnlyAfterSomeTries) {
+    TestPackage pkg = withStatus("late", 0);
+    pkg.wizard["install_uifile"] = "[]";
+    testutil::writePackageDir("/tmp/work-late", pkg);
+    // A mount point where the link must go: neither removable nor replaceable until a
+    // helper process unmounts it two seconds later.
+    ASSERT_EQ(CORVFSMkdirP("/var/packages/late/target", nullptr, 1, -1, -1, 0755), 0);
+    ASSERT_EQ(mount("tmpfs", "/var/packages/late/target", "tmpfs", 0, "size=1m"), 0);
+    pid_t helper = fork();
+    if (helper == 0) {
+        sleep(2);
+        _exit(umount("/var/packages/late/target") == 0 ? 0 : 1);
+    }
+    PackageManager pm;
+    PackageInfo info;
+    info.package = "late";
+    auto start = std::chrono::steady_clock::now();
+    EXPECT_TRUE(pm.registerPackage(PKG_INSTALL, info, "/tmp/work-late", "/volume1/@appstore/late"));
+    double waited = std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
+    int status = 0;
+    waitpid(helper, &status, 0);
+    EXPECT_GE(waited, 1.5) << "the first tries failed";
+    EXPECT_LT(waited, 30.0);
+    EXPECT_EQ(PMSReadLink("/var/packages/late/target"), "/volume1/@appstore/late");
+    EXPECT_TRUE(testutil::exists("/var/packages/late/WIZARD_UIFILES/install_uifile"));
 }

@@ -18,6 +18,7 @@
 #include "corvpkg/worker.h"
 #include "resource/resource_private.h"
 #include "support/files.h"
+#include "support/noop_worker.h"
 
 using namespace CORVPackageTool;
 using namespace CORVPackageTool::Resource;
@@ -96,20 +97,8 @@ class PluginWorker : public ::testing::Test {
     }
 };
 
-class BuiltinPort : public IWorker {
-  public:
-    int Acquire(const ActionInfo&, const Json::Value&, Json::Value&, WorkerResp&) override {
-        return 0;
-    }
-    int Rollback(const ActionInfo&, const Json::Value&, Json::Value&, WorkerResp&) override {
-        return 0;
-    }
-    int Release(const ActionInfo&, const Json::Value&, Json::Value&, WorkerResp&) override {
-        return 0;
-    }
-};
 IWorker* makeBuiltinPort() {
-    return new BuiltinPort();
+    return testutil::makeNoopWorker();
 }
 
 }  // namespace

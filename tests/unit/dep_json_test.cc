@@ -7,25 +7,14 @@
 
 #include "corvpkg/json_util.h"
 #include "corvpkg/pkgtool.h"
+#include "support/dep_entries.h"
 
 using namespace CORVPackageTool;
-using Entry = std::tuple<std::string, std::string, int>;
-
-namespace {
-std::vector<Entry> entries(const DepPkgVector& deps) {
-    std::vector<Entry> out;
-    for (const PackageBasicInfo& d : deps) {
-        out.emplace_back(d.package, d.version, static_cast<int>(d.compop));
-    }
-    return out;
-}
-}  // namespace
-
 TEST(DepJson, Parse) {
     const struct {
         const char* json;
         int count;
-        std::vector<Entry> expected;
+        std::vector<testutil::DepEntry> expected;
     } cases[] = {
         {R"({"a": {">=": "1.0", "<=": "2.0"}})", 1, {{"a", "1.0", 4}, {"a", "2.0", 5}}},
         {R"({"a": {"pkg_min_ver": "1.0", ">=": "2.0"}})", 1, {{"a", "1.0", 4}}},
@@ -48,7 +37,7 @@ TEST(DepJson, Parse) {
     for (const auto& c : cases) {
         DepPkgVector deps;
         EXPECT_EQ(PMSParseDepJSONString(c.json, deps), c.count) << c.json;
-        EXPECT_EQ(entries(deps), c.expected) << c.json;
+        EXPECT_EQ(testutil::depEntries(deps), c.expected) << c.json;
     }
     DepPkgVector deps;
     EXPECT_EQ(PMSParseDepJSONString("", deps), 0);

@@ -6,29 +6,15 @@
 #include <vector>
 
 #include "corvpkg/pkgtool.h"
+#include "support/dep_entries.h"
 #include "support/files.h"
 #include "support/temp_dir.h"
 
 using namespace CORVPackageTool;
-
-namespace {
-
-using Entry = std::tuple<std::string, std::string, int>;
-
-std::vector<Entry> entries(const DepPkgVector& deps) {
-    std::vector<Entry> out;
-    for (const PackageBasicInfo& d : deps) {
-        out.emplace_back(d.package, d.version, static_cast<int>(d.compop));
-    }
-    return out;
-}
-
-}  // namespace
-
 TEST(DepString, Grammar) {
     const struct {
         const char* text;
-        std::vector<Entry> expected;
+        std::vector<testutil::DepEntry> expected;
     } cases[] = {
         {"a>=1.0", {{"a", "1.0", 4}}},
         {"a>=", {}},
@@ -50,7 +36,7 @@ TEST(DepString, Grammar) {
     for (const auto& c : cases) {
         DepPkgVector deps;
         PMSExplodeDepPKGString(c.text, deps);
-        EXPECT_EQ(entries(deps), c.expected) << "input: [" << c.text << "]";
+        EXPECT_EQ(testutil::depEntries(deps), c.expected) << "input: [" << c.text << "]";
     }
     DepPkgVector none;
     PMSExplodeDepPKGString(nullptr, none);
@@ -68,7 +54,7 @@ TEST(DepConfFile, SectionsAndOSRanges) {
     const struct {
         const char* what;
         std::string file;
-        std::vector<Entry> expected;
+        std::vector<testutil::DepEntry> expected;
     } cases[] = {
         {"lower bound", "[a]\npkg_min_ver=1.0\n", {{"a", "1.0", 4}}},
         {"range", "[a]\npkg_min_ver=1\npkg_max_ver=2\n", {{"a", "1", 4}, {"a", "2", 5}}},
@@ -88,7 +74,7 @@ TEST(DepConfFile, SectionsAndOSRanges) {
         testutil::writeFile(path, c.file);
         DepPkgVector deps;
         EXPECT_GE(PMSLoadDepConfFile(path.c_str(), deps), 0) << c.what;
-        EXPECT_EQ(entries(deps), c.expected) << c.what << "\n" << c.file;
+        EXPECT_EQ(testutil::depEntries(deps), c.expected) << c.what << "\n" << c.file;
     }
 }
 

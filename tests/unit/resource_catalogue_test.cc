@@ -14,6 +14,7 @@
 #include "corvpkg/worker.h"
 #include "resource/resource_private.h"
 #include "support/files.h"
+#include "support/noop_worker.h"
 #include "support/temp_dir.h"
 
 using namespace CORVPackageTool::Resource;
@@ -23,21 +24,8 @@ using CORV::PkgUtils::WorkerResp;
 
 namespace {
 
-class NoopWorker : public IWorker {
-  public:
-    int Acquire(const ActionInfo&, const Json::Value&, Json::Value&, WorkerResp&) override {
-        return 0;
-    }
-    int Rollback(const ActionInfo&, const Json::Value&, Json::Value&, WorkerResp&) override {
-        return 0;
-    }
-    int Release(const ActionInfo&, const Json::Value&, Json::Value&, WorkerResp&) override {
-        return 0;
-    }
-};
-
 IWorker* makeNoop() {
-    return new NoopWorker();
+    return testutil::makeNoopWorker();
 }
 
 // Shaped like the real table: several rows for one id, spans of every kind, plus rows that

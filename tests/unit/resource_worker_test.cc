@@ -14,6 +14,7 @@
 #include "corvpkg/json_util.h"
 #include "corvpkg/worker.h"
 #include "support/files.h"
+#include "support/noop_worker.h"
 #include "support/temp_dir.h"
 
 using namespace CORVPackageTool::Resource;
@@ -27,19 +28,11 @@ namespace {
 // A worker that overrides only what it must, and counts the live instances.
 int g_alive = 0;
 
-class MinimalWorker : public IWorker {
+// Counts its instances, so that tests see who destroys the workers.
+class MinimalWorker : public testutil::NoopWorker {
   public:
     MinimalWorker() { ++g_alive; }
     ~MinimalWorker() override { --g_alive; }
-    int Acquire(const ActionInfo&, const Json::Value&, Json::Value&, WorkerResp&) override {
-        return 0;
-    }
-    int Rollback(const ActionInfo&, const Json::Value&, Json::Value&, WorkerResp&) override {
-        return 0;
-    }
-    int Release(const ActionInfo&, const Json::Value&, Json::Value&, WorkerResp&) override {
-        return 0;
-    }
 };
 
 IWorker* makeMinimal() {

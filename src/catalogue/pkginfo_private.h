@@ -61,6 +61,9 @@ enum : unsigned long long {
 // directory name, holds no character of `forbidden`, and is shorter than 492 bytes.
 bool PMSIsLegalName(const char* name, const char* forbidden);
 
+// "major.minor-build" with the build in four digits, as messages show an OS version.
+std::string PMSOSVersionText(const int v[3]);
+
 // Reads "major.minor-build" into `out`; numbers the text does not reach are 0.
 void PMSParseOSVersion(const char* text, int out[3]);
 

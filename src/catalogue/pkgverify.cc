@@ -4,6 +4,7 @@
 
 #include <string>
 
+#include "catalogue/pkginfo_private.h"
 #include "corv/log.h"
 #include "corv/vlibc.h"
 #include "corv/web.h"
@@ -20,13 +21,13 @@ namespace {
 constexpr unsigned int kPgsqlBit = 0x10;
 constexpr int kPgsqlVolumeKinds = 0x41;
 
-std::string osVersionText(const int v[3]) {
+}  // namespace
+
+std::string PMSOSVersionText(const int v[3]) {
     char buf[32];
     snprintf(buf, sizeof(buf), "%d.%d-%04d", v[0], v[1], v[2]);
     return buf;
 }
-
-}  // namespace
 
 bool PMSCheckPackagePortConflict(const PackageInfo& info) {
     // 1. An upgrade keeps its own port.
@@ -94,10 +95,10 @@ bool PackageManager::checkPkgInfoCanInstallEx(PackageInfo& info, const char* lan
     // 1.
     switch (PMSComparePackageAndOSVersion(info)) {
         case 1:
-            setResult(PKG_ERR_OS_TOO_NEW, Json::Value(osVersionText(PMSGetOSMaxVer(info))));
+            setResult(PKG_ERR_OS_TOO_NEW, Json::Value(PMSOSVersionText(PMSGetOSMaxVer(info))));
             return false;
         case -1:
-            setResult(PKG_ERR_OS_TOO_OLD, Json::Value(osVersionText(PMSGetOSMinVer(info))));
+            setResult(PKG_ERR_OS_TOO_OLD, Json::Value(PMSOSVersionText(PMSGetOSMinVer(info))));
             return false;
         default:
             break;

@@ -4,6 +4,7 @@
 
 #include <string>
 
+#include "catalogue/pkginfo_private.h"
 #include "corv/log.h"
 #include "corv/vlibc.h"
 #include "corvpkg/packagemanager.h"
@@ -16,12 +17,6 @@ namespace CORVPackageTool {
 namespace {
 
 constexpr int kPgsqlVolumeKinds = 0x41;
-
-std::string osVersionText(const int v[3]) {
-    char buf[32];
-    snprintf(buf, sizeof(buf), "%d.%d-%04d", v[0], v[1], v[2]);
-    return buf;
-}
 
 PKG_ERRCODE volumeError(int platformError) {
     switch (platformError) {
@@ -251,11 +246,11 @@ bool CheckPackageFileInfo(const char* language, const char* cpkFile, std::string
         // The upper limit is shown in both cases, also where the lower one failed.
         case PKG_ERR_OS_TOO_NEW:
             add("pkgmgr:pkgmgr_pkg_required_older_version");
-            add(osVersionText(PMSGetOSMaxVer(info)));
+            add(PMSOSVersionText(PMSGetOSMaxVer(info)));
             break;
         case PKG_ERR_OS_TOO_OLD:
             add("pkgmgr:pkgmgr_pkg_required_newer_version");
-            add(osVersionText(PMSGetOSMaxVer(info)));
+            add(PMSOSVersionText(PMSGetOSMaxVer(info)));
             break;
         default:
             add("error:error_error_system");

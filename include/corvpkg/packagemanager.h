@@ -211,6 +211,78 @@ class CORVPKG_API PackageManager {
     // The services of `services` that are not enabled, by display name.
     std::set<std::string> checkServiceStarted(std::set<std::string> services);
 
+    // Start and stop. One package, no lock, no dependency logic: 1 when the job did
+    // what was asked, else 0 with the reason in the result. `msg` says where a failure's
+    // text goes (the parameter "worker_msg", a desktop notification, or nowhere).
+    int serviceControlAction(PKG_INSTALLATION_TYPE type, const std::string& name, bool start,
+                             const char* language, const char* userName, MSG_TYPE msg);
+    // A package with its active dependents, under the package lock and a task record:
+    // dependents are stopped before the package and started after it. `order`, when given
+    // and not empty, is the stop order to use. The outcome is the named package's only.
+    // The lock is released on the way out unless `type` is 2 (an upgrade keeps it).
+    int serviceControl(PKG_INSTALLATION_TYPE type, const std::string& name, bool start,
+                       const char* language, const char* userName,
+                       std::vector<std::string>* order, bool withDependents,
+                       bool restartRelated);
+    // The user's start (type 8) or stop (type 0x10), with dependents and related daemons.
+    int serviceControl(const std::string& name, bool start, const char* ignored);
+    // Stop, and start again only if the stop succeeded.
+    int serviceControlRestart(const std::string& name);
+    // What a package holds while enabled: the desktop link, `enabled`, the resources of
+    // TIMING_DISABLE. Type 0 keeps all. Failures are logged and never change the result.
+    void removePkgResources(PKG_INSTALLATION_TYPE type, const PackageInfo& info, MSG_TYPE msg);
+    // Takes back the user's intent to run a package that cannot: removes `enabled` and
+    // stops the package with its dependents; with type 0 the administrators are told.
+    void DisableWithDependents(PKG_INSTALLATION_TYPE type, const PackageInfo& info,
+                               const char* language, const char* userName);
+
+    // Installation, upgrade, removal. Each returns 1 on success and 0 on failure with the
+    // reason in the result; "worker_msg" carries a failed resource step's messages. What a
+    // failure leaves behind is stated at each definition. All run under the package lock;
+    // callers of install_package and upgrade_package hold it and release it afterwards.
+    int install_package(const std::string& cpkPath, const std::string& volume,
+                        const std::string& storeRoot, const std::string& tmpRoot,
+                        bool startAfterInstall, const Json::Value* extra, const char* language,
+                        const char* userName);
+    int upgrade_package(const std::string& cpkPath, const std::string& volume,
+                        const std::string& storeRoot, const std::string& tmpRoot, bool repair,
+                        const Json::Value* extra, const char* language, const char* userName,
+                        bool ignoreDependents);
+    int uninstall(const PackageInfo& info, const Json::Value* extra, const char* language,
+                  PKG_INSTALLATION_TYPE type, const char* userName);
+    // By name: refuses (PKG_ERR_DEPENDENCY, parameter "deppkg") while installed packages
+    // depend on it, unless `force`.
+    int uninstall(const std::string& name, const Json::Value* extra, const char* language,
+                  PKG_INSTALLATION_TYPE type, bool force, const char* userName);
+    // Several packages, dependents first; 1 only if every one went.
+    int uninstallPKGs(const std::vector<std::string>& names, bool toStdout);
+
+    // The one entrance for a .cpk: decides between install, upgrade and repair, picks the
+    // volume and a temporary directory. `volume` may be empty; a saved default volume wins
+    // over it. 1 on success, else 0 with the reason in the result.
+    int install(const char* userName, const std::string& cpkPath, const std::string& volume,
+                bool startAfterInstall, const Json::Value* extra, const char* language,
+                bool ignoreDependents, bool checkSignature);
+    int install(const char* userName, const std::string& cpkPath, const std::string& volume,
+                bool startAfterInstall, const Json::Value* extra, const char* language,
+                bool ignoreDependents);
+    int installCPK(const char* userName, std::string cpkPath, const std::string& volume);
+    bool post_install(const PackageInfo& info);
+
+    // Wizards. The steps of the wizard for `type` (1 install, 2 upgrade, 4 uninstall) go
+    // to info.wizard; a package without one, or with a broken one, gets an empty wizard.
+    bool parseUIFile(const std::string& cpkFile, const std::string& dir,
+                     PKG_INSTALLATION_TYPE type, PackageInfo& info, const char* language);
+    // queryPackageFileInfo with the LICENSE and the wizard; type 0 means install or
+    // upgrade, whichever fits what is installed.
+    bool queryPackageFileInfoWithWizard(const std::string& cpkFile, PackageInfo& info,
+                                        PKG_INSTALLATION_TYPE type, const char* language);
+    // The wizard of an installed package. True when one was found (always for type 0).
+    bool readUIFile(PKG_INSTALLATION_TYPE type, const std::string& name, PackageInfo& info,
+                    const char* language) const;
+    bool readUIFile(const std::string& name, const std::string& type, PackageInfo& info,
+                    const char* language) const;
+
     std::string getFixedLogFilePath(const std::string& name);
     std::string getLogFilePath();
 

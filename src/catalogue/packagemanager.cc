@@ -7,6 +7,7 @@
 #include <map>
 #include <utility>
 
+#include "catalogue/packagemanager_private.h"
 #include "common/vlibc_holders.h"
 #include "corv/log.h"
 #include "corv/service.h"
@@ -15,15 +16,6 @@
 #include "corvpkg/pkgtool.h"
 
 namespace CORVPackageTool {
-
-class PackageManagerPrivate {
-  public:
-    PKG_ERRCODE result = PKG_OK;
-    Json::Value resultData;
-    unsigned int intParam = 0;
-    std::map<std::string, std::string> params;
-    PackageInfo packageInfo;
-};
 
 namespace {
 

@@ -85,5 +85,17 @@ int cmdInspect(const std::vector<std::string>& args);
 int cmdCheck(const std::vector<std::string>& args);
 int cmdResource(const std::vector<std::string>& args);
 int cmdJobs(const std::vector<std::string>& args);
+int cmdStart(const std::vector<std::string>& args);
+int cmdStop(const std::vector<std::string>& args);
+int cmdRestart(const std::vector<std::string>& args);
+
+namespace CORVPackageTool {
+class PackageManager;
+}
+// The end of an operation: on success "<done> <name>" (and any "worker_msg"); on failure
+// the result code's name, the library's reasons, and the result data and parameters.
+int printOperationOutcome(const CommonOptions& opts, CORVPackageTool::PackageManager& pm,
+                          int outcome, const char* done, const std::string& name,
+                          const LogCapture& log);
 
 }  // namespace cli

@@ -60,3 +60,10 @@ std::string PMSEnabledFlagPath(const std::string& name);
 void PMSNotifyAdministrators(const std::vector<std::string>& args);
 
 }  // namespace CORVPackageTool
+
+namespace CORVPackageTool {
+
+// The look for newer versions that runs, detached, after every successful install.
+void PMSRunUpgradeCheck(const char* userName, const char* language);
+
+}  // namespace CORVPackageTool

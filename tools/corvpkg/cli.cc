@@ -1,5 +1,8 @@
 #include "cli.h"
 
+#include <sys/stat.h>
+#include <unistd.h>
+
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
@@ -98,6 +101,11 @@ int printFailure(bool json, int code, const std::string& reason, const Json::Val
         }
     }
     return EXIT_FAILED;
+}
+
+bool isReadableFile(const std::string& path) {
+    struct stat st {};
+    return stat(path.c_str(), &st) == 0 && S_ISREG(st.st_mode) && access(path.c_str(), R_OK) == 0;
 }
 
 int usageError(const Command& command, const std::string& message) {

@@ -8,6 +8,8 @@
 #include <string>
 #include <vector>
 
+#include "corvpkg/packagemanager.h"
+
 namespace cli {
 
 // Exit statuses of the program.
@@ -58,6 +60,9 @@ int printFailure(bool json, int code, const std::string& reason,
 // The usage error path: message and the command's usage on standard error.
 int usageError(const Command& command, const std::string& message);
 
+// A regular file that this process may read.
+bool isReadableFile(const std::string& path);
+
 // Collects the library's log lines while alive, so that a failure can say why.
 class LogCapture {
   public:
@@ -89,9 +94,6 @@ int cmdStart(const std::vector<std::string>& args);
 int cmdStop(const std::vector<std::string>& args);
 int cmdRestart(const std::vector<std::string>& args);
 
-namespace CORVPackageTool {
-class PackageManager;
-}
 // The end of an operation: on success "<done> <name>" (and any "worker_msg"); on failure
 // the result code's name, the library's reasons, and the result data and parameters.
 int printOperationOutcome(const CommonOptions& opts, CORVPackageTool::PackageManager& pm,

@@ -16,11 +16,6 @@ using namespace CORVPackageTool;
 
 namespace {
 
-bool isFile(const std::string& path) {
-    struct stat st {};
-    return stat(path.c_str(), &st) == 0 && S_ISREG(st.st_mode);
-}
-
 Json::Value scriptNames(unsigned int mask) {
     Json::Value names(Json::arrayValue);
     for (const PKG_SCRIPT_ENTRY& script : g_PackageScripts) {
@@ -74,7 +69,7 @@ int cmdInspect(const std::vector<std::string>& args) {
         return status;
     }
     const std::string& file = opts.positional[0];
-    if (!isFile(file)) {
+    if (!isReadableFile(file)) {
         return printFailure(opts.json, PKG_ERR_FILE_ACCESS, file + " is not a readable file");
     }
     PackageManager pm;
@@ -114,7 +109,7 @@ int cmdCheck(const std::vector<std::string>& args) {
         return status;
     }
     const std::string& file = opts.positional[0];
-    if (!isFile(file)) {
+    if (!isReadableFile(file)) {
         return printFailure(opts.json, PKG_ERR_FILE_ACCESS, file + " is not a readable file");
     }
     PackageInfo info;

@@ -7,6 +7,7 @@
 #include "corvpkg/pkginfo_json.h"
 #include "corvpkg/pkgtool.h"
 #include "corvpkg/pkgtypes.h"
+#include "corvpkg/pkgwizard.h"
 #include "corvpkg/visibility.h"
 
 namespace CORVPackageTool {

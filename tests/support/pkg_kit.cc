@@ -44,12 +44,19 @@ static void writeParts(const std::string& dir, const TestPackage& pkg) {
         writeFile(dir + "/conf/" + name, content);
     }
     for (const auto& [name, content] : pkg.wizard) {
-        writeFile(dir + "/WIZARD_UIFILES/" + name, content);
+        const std::string path = dir + "/WIZARD_UIFILES/" + name;
+        writeFile(path, content);
+        if (name.size() > 3 && name.compare(name.size() - 3, 3, ".sh") == 0) {
+            chmod(path.c_str(), 0755);
+        }
     }
 }
 
 void writePackageDir(const std::string& dir, const TestPackage& pkg) {
     writeParts(dir, pkg);
+    for (const auto& [name, content] : pkg.extraFiles) {
+        writeFile(dir + "/" + name, content);
+    }
     writeFile(dir + "/package/.keep", "");
     for (const auto& [path, content] : pkg.payload) {
         writeFile(dir + "/package/" + path, content);

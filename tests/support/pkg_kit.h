@@ -27,10 +27,13 @@ struct TestPackage {
                                                {"arch", "x86_64 armv7 armv8 x86 broadwell"}};
     // scripts/<name> -> shell body (a "#!/bin/sh" line is prepended; made executable).
     std::map<std::string, std::string> scripts;
-    // conf/<name> -> content; WIZARD_UIFILES/<name> -> content; package/<path> -> content.
+    // conf/<name> -> content; WIZARD_UIFILES/<name> -> content (a name ending in ".sh" is
+    // made executable and gets no "#!" line: write one); package/<path> -> content.
     std::map<std::string, std::string> conf;
     std::map<std::string, std::string> wizard;
     std::map<std::string, std::string> payload;
+    // Further members at the top of the package, such as "LICENSE" -> content.
+    std::map<std::string, std::string> extraFiles;
 };
 
 // A start-stop-status body: "status" exits with `statusExit`, "log" prints `logText`, and
@@ -39,7 +42,8 @@ std::string statusScript(int statusExit, const std::string& logText = "log of th
 
 // The INFO text of a package.
 std::string infoOf(const TestPackage& pkg);
-// Writes an unpacked package: <dir>/INFO, scripts/, conf/, WIZARD_UIFILES/, package/.
+// Writes an unpacked package: <dir>/INFO, scripts/, conf/, WIZARD_UIFILES/, the extra
+// files, package/.
 void writePackageDir(const std::string& dir, const TestPackage& pkg);
 // Writes the registry of an installed package: /var/packages/<name> with INFO, scripts,
 // conf and wizard files, the `target` link to <volume>/@appstore/<name> (made, with the

@@ -93,6 +93,8 @@ int cmdJobs(const std::vector<std::string>& args);
 int cmdStart(const std::vector<std::string>& args);
 int cmdStop(const std::vector<std::string>& args);
 int cmdRestart(const std::vector<std::string>& args);
+int cmdWizard(const std::vector<std::string>& args);
+extern const char kWizardUsage[];
 
 // The end of an operation: on success "<done> <name>" (and any "worker_msg"); on failure
 // the result code's name, the library's reasons, and the result data and parameters.

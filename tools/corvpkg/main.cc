@@ -121,6 +121,7 @@ const std::vector<Command>& commands() {
          "system says of the job, whether it runs, whether the service is enabled, and the\n"
          "package's own jobs.\n",
          cmdJobs},
+        {"wizard", "show a package's wizard steps or defaults", kWizardUsage, cmdWizard},
     };
     return table;
 }

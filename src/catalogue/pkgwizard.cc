@@ -1,0 +1,292 @@
+// Wizard pages: finding the wizard file of an operation in a package file or in the
+// registry, running it when it is a script, and reading the steps it gives.
+#include <stdio.h>
+#include <unistd.h>
+
+#include <fstream>
+#include <string>
+#include <vector>
+
+#include "catalogue/pkginfo_private.h"
+#include "catalogue/pkgwizard_private.h"
+#include "corv/log.h"
+#include "corv/process_runner.h"
+#include "corv/vlibc.h"
+#include "corvpkg/json_util.h"
+#include "corvpkg/packagemanager.h"
+#include "corvpkg/pkgfile.h"
+#include "corvpkg/pkglog.h"
+#include "corvpkg/pkgtool.h"
+#include "corvpkg/pkgvolume.h"
+#include "corvpkg/pkgwizard.h"
+
+namespace CORVPackageTool {
+
+namespace {
+
+constexpr unsigned int kLicenseLimit = 0x100000;
+
+// Removes a temporary folder of ours on every way out.
+class TempFolder {
+  public:
+    explicit TempFolder(std::string path) : path_(std::move(path)) {}
+    ~TempFolder() {
+        if (!path_.empty() && VLIBCFileCheckDir(path_.c_str())) {
+            VLIBCExec("/bin/rm", "-rf", path_.c_str(), nullptr);
+        }
+    }
+    TempFolder(const TempFolder&) = delete;
+    TempFolder& operator=(const TempFolder&) = delete;
+
+  private:
+    std::string path_;
+};
+
+// Unlinks a temporary file of ours on every way out.
+class TempFile {
+  public:
+    TempFile() = default;
+    ~TempFile() {
+        if (!path_.empty()) {
+            unlink(path_.c_str());
+        }
+    }
+    TempFile(const TempFile&) = delete;
+    TempFile& operator=(const TempFile&) = delete;
+    std::string& path() { return path_; }
+
+  private:
+    std::string path_;
+};
+
+bool isScript(const std::string& name) {
+    static const std::string kSuffix = ".sh";
+    return name.size() >= kSuffix.size() &&
+           name.compare(name.size() - kSuffix.size(), kSuffix.size(), kSuffix) == 0;
+}
+
+int extractMember(const std::string& cpkFile, const std::string& dir, const std::string& member) {
+    CORVUtils::ProcessRunner tar("/bin/tar", {"xf", cpkFile, "-C", dir, member, "--no-same-owner"});
+    return tar.run(true, true);
+}
+
+// Reads the wizard file `path` found for `info`; a script is run first.
+void readCandidate(const PackageInfo& info, const char* cpkFile, const std::string& path,
+                   const char* language, PKG_INSTALLATION_TYPE type, Json::Value& wizard) {
+    if (isScript(path)) {
+        PMSRunUIScript(info, cpkFile, path, language, type, wizard);
+    } else {
+        PMReadUIFileContent(path, wizard);
+    }
+}
+
+}  // namespace
+
+bool PMSExtractUIFile(const char* cpkFile, const char* dir, const std::string& member,
+                      std::string& path) {
+    if (cpkFile == nullptr || dir == nullptr) {
+        return false;
+    }
+    const std::string extracted = std::string(dir) + "/" + member;
+    if (extractMember(cpkFile, dir, member) != 0 || !VLIBCFileExist(extracted.c_str())) {
+        return false;
+    }
+    path = extracted;
+    return true;
+}
+
+bool PMSRunUIScript(const PackageInfo& info, const char* cpkFile, const std::string& script,
+                    const char* language, PKG_INSTALLATION_TYPE type, Json::Value& wizard) {
+    // 1. The result file goes on every way out (5).
+    CORVUtils::ProcessRunner runner(script);
+    TempFile result;
+    if (!PMSCreateTmpFile(result.path())) {
+        return false;
+    }
+    const std::string& resultFile = result.path();
+    // 2.
+    switch (type) {
+        case PKG_INSTALL:
+            PMSPrepareScriptEnv(info, runner, language, &resultFile, PKG_INSTALL, nullptr, nullptr,
+                                cpkFile, nullptr);
+            break;
+        case PKG_UPGRADE: {
+            // The upgrade wizard speaks for the installed package, which it may ask about.
+            PackageManager pm;
+            PackageInfo installed;
+            if (!pm.getInstallPackageInfo(info.package, installed, language, PKG_INFO_MASK_ALL)) {
+                CORV_LOG_ERR("Previous %s not installed, upgrade not possible",
+                             info.package.c_str());
+                return false;
+            }
+            runner.addEnv("CORVPKG_OLD_PKGVER", installed.version);
+            PMSPrepareScriptEnv(installed, runner, language, &resultFile, PKG_UPGRADE, nullptr,
+                                nullptr, cpkFile, nullptr);
+            break;
+        }
+        case PKG_UNINSTALL:
+            PMSPrepareScriptEnv(info, runner, language, &resultFile, PKG_UNINSTALL, nullptr,
+                                nullptr, nullptr, nullptr);
+            break;
+        default:
+            return false;
+    }
+    // 3. The script's own output is not the wizard; it is captured and dropped.
+    if (runner.run(true, true) != 0) {
+        CORV_LOG_ERR("Failed to run %s for %s", script.c_str(), info.package.c_str());
+        return false;
+    }
+    // 4. A script that ran has done its part; what it wrote is judged by the caller.
+    PMReadUIFileContent(resultFile, wizard);
+    return true;
+}
+
+bool PMReadUIFileContent(const std::string& path, Json::Value& wizard) {
+    // 1.
+    std::ifstream in(path);
+    if (!in.is_open()) {
+        CORV_LOG_ERR("Fail to read %s", path.c_str());
+        return false;
+    }
+    // 2. Parsed aside: a half-read document must not pass for steps and stop the search
+    // for the next wizard file.
+    Json::Reader reader;
+    Json::Value parsed;
+    if (!reader.parse(in, parsed)) {
+        CORV_LOG_ERR("%s: %s", path.c_str(), reader.getFormattedErrorMessages().c_str());
+        return false;
+    }
+    wizard = parsed;
+    // 3.
+    if (!wizard.isArray()) {
+        CORV_LOG_ERR("Fail to parse %s", path.c_str());
+        return false;
+    }
+    // 4.
+    for (const Json::Value& step : wizard) {
+        if (!step.isObject() || !step["items"].isArray()) {
+            CORV_LOG_ERR("Fail to parse %s in [items]", path.c_str());
+            return false;
+        }
+    }
+    // 5.
+    return true;
+}
+
+namespace {
+
+// The text of a JSON value as an answer: numbers and booleans in their JSON spelling,
+// null as "", arrays and objects as compact JSON.
+std::string answerText(const Json::Value& value) {
+    if (value.isArray() || value.isObject()) {
+        return toString(value);
+    }
+    return value.asString();
+}
+
+void collectDefaults(const Json::Value& node, Json::Value& values) {
+    if (node.isArray()) {
+        for (const Json::Value& element : node) {
+            collectDefaults(element, values);
+        }
+        return;
+    }
+    if (!node.isObject()) {
+        return;
+    }
+    if (node.isMember("key") && node.isMember("defaultValue")) {
+        values[answerText(node["key"])] = answerText(node["defaultValue"]);
+    }
+    for (const Json::Value& member : node) {
+        if (member.isArray() || member.isObject()) {
+            collectDefaults(member, values);
+        }
+    }
+}
+
+}  // namespace
+
+void getUIDefaultValues(Json::Value ui, Json::Value& values) {
+    // Answers are members of an object; anything else cannot take them.
+    if (!values.isNull() && !values.isObject()) {
+        return;
+    }
+    collectDefaults(ui, values);
+}
+
+bool PackageManager::parseUIFile(const std::string& cpkFile, const std::string& dir,
+                                 PKG_INSTALLATION_TYPE type, PackageInfo& info,
+                                 const char* language) {
+    for (const std::string& candidate : PMSUIFileCandidates(language, type)) {
+        std::string path;
+        if (!PMSExtractUIFile(cpkFile.c_str(), dir.c_str(), candidate, path)) {
+            continue;
+        }
+        readCandidate(info, cpkFile.c_str(), path, language, type, info.wizard);
+        if (!info.wizard.empty()) {
+            break;
+        }
+    }
+    // A package without a wizard, or with a broken one, goes on without one.
+    return true;
+}
+
+bool PackageManager::queryPackageFileInfoWithWizard(const std::string& cpkFile, PackageInfo& info,
+                                                    PKG_INSTALLATION_TYPE type,
+                                                    const char* language) {
+    // 1. The folder goes on every way out (6).
+    if (cpkFile.empty()) {
+        CORV_LOG_ERR("Wrong parameters");
+        return false;
+    }
+    std::string tmp;
+    if (!PMSCreateTmpFolder(tmp)) {
+        CORV_LOG_ERR("Failed to generate temp filename");
+        return false;
+    }
+    TempFolder cleanup(tmp);
+    // 2.
+    if (!PMSExtractPackageInfo(tmp, cpkFile, info, language)) {
+        CORV_LOG_ERR("Failed to query info");
+        return false;
+    }
+    // 3. A package need not have a licence; a longer one is cut, not refused.
+    const std::string license = tmp + "/LICENSE";
+    if (extractMember(cpkFile, tmp, "LICENSE") == 0 && VLIBCFileExist(license.c_str()) &&
+        !PMReadFile(license.c_str(), kLicenseLimit, info.license, nullptr)) {
+        CORV_LOG_ERR("Failed to read license file LICENSE in %s", cpkFile.c_str());
+        return false;
+    }
+    // 4.
+    if (type == 0) {
+        type = PMSCheckPackage(info.package) ? PKG_UPGRADE : PKG_INSTALL;
+    }
+    // 5.
+    return parseUIFile(cpkFile, tmp, type, info, language);
+}
+
+bool PackageManager::readUIFile(PKG_INSTALLATION_TYPE type, const std::string& name,
+                                PackageInfo& info, const char* language) const {
+    if (type == 0) {
+        return true;
+    }
+    for (const std::string& candidate : PMSUIFileCandidates(language, type)) {
+        char path[4096];
+        snprintf(path, sizeof(path), "/var/packages/%s/%s", name.c_str(), candidate.c_str());
+        if (!VLIBCFileExist(path)) {
+            continue;
+        }
+        readCandidate(info, nullptr, path, language, type, info.wizard);
+        if (!info.wizard.empty()) {
+            return true;
+        }
+    }
+    return false;
+}
+
+bool PackageManager::readUIFile(const std::string&, const std::string&, PackageInfo&,
+                                const char*) const {
+    return false;
+}
+
+}  // namespace CORVPackageTool

@@ -1,0 +1,33 @@
+#!/bin/sh
+# Builds the example packages with the corvpkg command line, named <package>-<version>:
+#   OUTDIR/hello-1.0.0-0001.cpk
+#   OUTDIR/greeter-1.0.0-0001.cpk
+#   OUTDIR/greeter-1.1.0-0001.cpk   the same source with the version raised, to upgrade to
+# usage: examples/build.sh CORVPKG OUTDIR
+set -eu
+
+if [ $# -ne 2 ]; then
+    echo "usage: $0 CORVPKG OUTDIR" >&2
+    exit 2
+fi
+corvpkg=$1
+out=$2
+here=$(cd "$(dirname "$0")" && pwd)
+upgrade_version=1.1.0-0001
+
+version_of() {
+    sed -n 's/^version="\(.*\)"$/\1/p' "$1/INFO"
+}
+
+mkdir -p "$out"
+for name in hello greeter; do
+    "$corvpkg" build "$here/$name" -o "$out/$name-$(version_of "$here/$name").cpk"
+done
+
+# The upgrade differs from the source only in its version, which its daemon shows in
+# every answer and its scripts write into their record.
+stage=$(mktemp -d)
+trap 'rm -rf "$stage"' EXIT
+cp -a "$here/greeter" "$stage/greeter"
+sed "s/^version=.*/version=\"$upgrade_version\"/" "$here/greeter/INFO" >"$stage/greeter/INFO"
+"$corvpkg" build "$stage/greeter" -o "$out/greeter-$upgrade_version.cpk"

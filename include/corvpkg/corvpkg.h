@@ -3,6 +3,7 @@
 
 #include "corvpkg/json_util.h"
 #include "corvpkg/packagemanager.h"
+#include "corvpkg/pkgapppriv.h"
 #include "corvpkg/pkginfo.h"
 #include "corvpkg/pkginfo_json.h"
 #include "corvpkg/pkgtool.h"

@@ -6,6 +6,7 @@
 #include "corvpkg/pkgapppriv.h"
 #include "corvpkg/pkginfo.h"
 #include "corvpkg/pkginfo_json.h"
+#include "corvpkg/pkgschedule.h"
 #include "corvpkg/pkgtool.h"
 #include "corvpkg/pkgtypes.h"
 #include "corvpkg/pkgwizard.h"

@@ -44,6 +44,52 @@ class CORVPKG_API CtrlScriptWalker : public IWalker {
     int identity = IDENTITY_INVALID;
 };
 
+// The owner a package's "executable" and "tool" entries give to files under `topDir`
+// (the unpacked payload): `uid`/`gid` are those of the package's user and group.
+class CORVPKG_API ReviseWalker : public IWalker {
+  public:
+    ReviseWalker(const std::string& topDir, unsigned uid, unsigned gid);
+    ~ReviseWalker() override;
+    const std::string& GetTopDir() const { return topDir; }
+    unsigned GetPkgUid() const { return uid; }
+    unsigned GetPkgGid() const { return gid; }
+
+  protected:
+    std::string topDir;
+    unsigned uid;
+    unsigned gid;
+};
+
+// {"relpath", "run-as"}: the program's owner by identity (system: the package's user
+// with group id 1; root: 0:0).
+class CORVPKG_API ExeWalker : public ReviseWalker {
+  public:
+    ExeWalker(const std::string& topDir, unsigned uid, unsigned gid);
+    ~ExeWalker() override;
+    int walk(const Json::Value& entry) override;
+};
+
+// {"relpath", "user", "group", "permission"}: owner ("root" or "package" each) and a mode
+// of exactly four octal digits.
+class CORVPKG_API ToolWalker : public ReviseWalker {
+  public:
+    ToolWalker(const std::string& topDir, unsigned uid, unsigned gid);
+    ~ToolWalker() override;
+    int walk(const Json::Value& entry) override;
+};
+
+// Takes the set-user-id and set-group-id bits off the regular file `path`; other bits,
+// the sticky bit among them, stay. False with 0x0700 (missing), 0x0900 (cannot open),
+// 0x2700 (stat), 0xD900 (not a regular file) or 0x2A00 (chmod).
+CORVPKG_API bool ClearSetUGidBit(const std::string& path);
+
+// Makes the package unpacked at `dir` safe and owned as its conf/privilege says, before
+// any of its scripts runs: clears set-id bits of the scripts, creates the package's user
+// and group, chowns the payload to the default identity and applies the "executable" and
+// "tool" overrides. Without a privilege file only the scripts are cleaned. False (logged,
+// error slot set) on the first failure; what was already changed stays changed.
+CORVPKG_API bool ReviseFileAttr(const std::string& name, const std::string& dir);
+
 // <dir>/conf/privilege when it exists (else 0xD900 and false); GetConfPath for an
 // installed package.
 CORVPKG_API bool GetConfPathFrom(const std::string& dir, std::string& path);

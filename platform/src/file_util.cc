@@ -155,7 +155,10 @@ int CORVFSMkdirP(const char* path, const char*, int parents, int uid, int gid, m
         if (level.empty() || level.back() == '/' || isDirectory(level.c_str())) {
             continue;  // the root, a doubled slash, or a level that is there already
         }
-        if (makeLevel(level, uid, gid, mode) < 0) {
+        // Levels above the last stay open for traversal, as with mkdir -p -m: a private
+        // folder deep in a shared tree must not close the tree to its owner.
+        const bool last = pos == std::string::npos;
+        if (makeLevel(level, last ? uid : -1, last ? gid : -1, last ? mode : (mode | 0755)) < 0) {
             return -1;
         }
     }

@@ -112,10 +112,14 @@ TEST(PlatformFile, MkdirPMakesEveryLevelWithItsMode) {
         EXPECT_EQ(CORVFSMkdirP(path.c_str(), nullptr, c.parents, -1, -1, 0770), c.rc) << c.what;
     }
     umask(old);
-    for (const char* made : {"/a", "/a/b", "/a/b/c", "/x", "/x/y", "/one"}) {
-        struct stat st = statOf(dir.path() + made);
-        EXPECT_TRUE(S_ISDIR(st.st_mode)) << made;
-        EXPECT_EQ(st.st_mode & 07777, 0770u) << made << ": the mode asked for, not the umask's";
+    // The last level gets the mode asked for, not the umask's; levels above it stay open
+    // for traversal.
+    const std::pair<const char*, mode_t> made[] = {{"/a", 0775}, {"/a/b", 0775}, {"/a/b/c", 0770},
+                                                   {"/x", 0775}, {"/x/y", 0770}, {"/one", 0770}};
+    for (const auto& [level, mode] : made) {
+        struct stat st = statOf(dir.path() + level);
+        EXPECT_TRUE(S_ISDIR(st.st_mode)) << level;
+        EXPECT_EQ(st.st_mode & 07777, mode) << level;
     }
     EXPECT_EQ(VLIBCErrGet(), ERR_MKDIR_FAILED);
 

@@ -160,8 +160,9 @@ int VLIBCFileEnumDir(const char* dir, const char* suffix, PVLIBSZLIST* list, int
 // read(2) that retries on EINTR. Bytes read, or -1.
 ssize_t VLIBCRead(int fd, void* buffer, size_t size);
 
-// Creates `path`; with `parents` also every missing level, each with `mode`, and chowns
-// the levels it created to uid/gid when those are not -1. An existing directory is
+// Creates `path` with `mode`, chowned to uid/gid when those are not -1; with `parents`
+// also every missing level above it, as mkdir -p -m does: those get `mode` | 0755 and keep
+// the caller's owner, so that the tree stays traversable. An existing directory is
 // success. 0, or -1 with ERR_MKDIR_FAILED (ERR_NO_SPACE for ENOSPC).
 int CORVFSMkdirP(const char* path, const char* reserved, int parents, int uid, int gid,
                  mode_t mode);

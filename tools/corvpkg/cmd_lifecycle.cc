@@ -1,0 +1,104 @@
+// corvpkg start, stop and restart: drive installed packages with their dependents.
+#include <stdio.h>
+
+#include <string>
+
+#include "cli.h"
+#include "corvpkg/corvpkg.h"
+#include "corvpkg/pkgvolume.h"
+
+namespace cli {
+
+using namespace CORVPackageTool;
+
+namespace {
+
+const char* optionalText(const CommonOptions& opts, const char* name) {
+    auto it = opts.options.find(name);
+    return it == opts.options.end() ? nullptr : it->second.c_str();
+}
+
+}  // namespace
+
+int printOperationOutcome(const CommonOptions& opts, PackageManager& pm, int outcome,
+                          const char* done, const std::string& name, const LogCapture& log) {
+    Json::Value data(Json::objectValue);
+    pm.getResult(data["result"]);
+    if (data["result"].isNull()) {
+        data.removeMember("result");
+    }
+    Json::Value workerMsg = pm.getJsonParam("worker_msg");
+    if (!(workerMsg.isString() && workerMsg.asString().empty())) {
+        data["worker_msg"] = workerMsg;
+    }
+    for (const char* key : {"deppkg", "oldver", "curver", "services"}) {
+        const std::string value = pm.getMapParam(key);
+        if (!value.empty()) {
+            data[key] = value;
+        }
+    }
+    if (outcome == 0) {
+        return printFailure(opts.json, pm.getResult(), log.reasons(),
+                            data.empty() ? Json::Value() : data);
+    }
+    if (opts.json) {
+        Json::Value out(Json::objectValue);
+        out["success"] = true;
+        out["package"] = name;
+        out["action"] = done;
+        if (data.isMember("worker_msg")) {
+            out["worker_msg"] = data["worker_msg"];
+        }
+        printf("%s\n", toString(out).c_str());
+    } else {
+        printf("%s %s\n", done, name.c_str());
+        if (data.isMember("worker_msg")) {
+            printf("worker_msg: %s\n", toString(data["worker_msg"]).c_str());
+        }
+    }
+    return EXIT_OK;
+}
+
+namespace {
+
+int startStop(const std::vector<std::string>& args, const char* command, bool start, bool restart) {
+    CommonOptions opts;
+    if (int status = parseSingle(args, command, "package name", opts, {{"--user", true}});
+        status >= 0) {
+        return status;
+    }
+    const std::string& name = opts.positional[0];
+    PackageManager pm;
+    LogCapture log;
+    // Without this a name that is not installed has no dependency order and counts as done.
+    if (!PMSCheckPackage(name)) {
+        return printFailure(opts.json, PKG_ERR_NOT_INSTALLED, name + " is not installed");
+    }
+    const char* language = opts.lang.empty() ? nullptr : opts.lang.c_str();
+    int outcome = 0;
+    if (restart) {
+        outcome = pm.serviceControlRestart(name);
+    } else {
+        outcome =
+            pm.serviceControl(static_cast<PKG_INSTALLATION_TYPE>(start ? 8 : 0x10), name, start,
+                              language, optionalText(opts, "--user"), nullptr, true, true);
+    }
+    return printOperationOutcome(
+        opts, pm, outcome, restart ? "restarted" : (start ? "started" : "stopped"), name, log);
+}
+
+}  // namespace
+
+int cmdStart(const std::vector<std::string>& args) {
+    return startStop(args, "start", true, false);
+}
+
+int cmdStop(const std::vector<std::string>& args) {
+    return startStop(args, "stop", false, false);
+}
+
+int cmdRestart(const std::vector<std::string>& args) {
+    return startStop(args, "restart", false, true);
+}
+
+}  // namespace cli

@@ -131,19 +131,27 @@ TEST(PlatformFile, MkdirPMakesEveryLevelWithItsMode) {
     EXPECT_EQ(CORVFSMkdirP("", nullptr, 1, -1, -1, 0755), -1);
 }
 
-TEST(PlatformFile, MkdirPChownsOnlyWhatItMade) {
+TEST(PlatformFile, MkdirPChownsOnlyTheLastLevel) {
     if (geteuid() != 0) {
         GTEST_SKIP() << "changing owners needs root";
     }
     TempDir dir;
     const std::string base = dir.path() + "/base";
     ASSERT_EQ(mkdir(base.c_str(), 0755), 0);
-    ASSERT_EQ(CORVFSMkdirP((base + "/u/v").c_str(), nullptr, 1, 4321, -1, 0755), 0);
-    EXPECT_EQ(statOf(base).st_uid, 0u);
-    for (const char* level : {"/u", "/u/v"}) {
-        struct stat st = statOf(base + level);
-        EXPECT_EQ(st.st_uid, 4321u) << level;
-        EXPECT_EQ(st.st_gid, 0u) << level << ": -1 leaves the group";
+    ASSERT_EQ(CORVFSMkdirP((base + "/u/v").c_str(), nullptr, 1, 4321, -1, 0700), 0);
+    // A folder made for a package's user under shared parents: the parents stay the
+    // caller's and traversable, or the user could never reach its own folder.
+    struct Case {
+        const char* level;
+        uid_t uid;
+        mode_t mode;
+    };
+    const Case cases[] = {{"", 0, 0755}, {"/u", 0, 0755}, {"/u/v", 4321, 0700}};
+    for (const Case& c : cases) {
+        struct stat st = statOf(base + c.level);
+        EXPECT_EQ(st.st_uid, c.uid) << c.level;
+        EXPECT_EQ(st.st_gid, 0u) << c.level << ": -1 leaves the group";
+        EXPECT_EQ(st.st_mode & 07777, c.mode) << c.level;
     }
 }
 

@@ -94,6 +94,10 @@ int cmdStart(const std::vector<std::string>& args);
 int cmdStop(const std::vector<std::string>& args);
 int cmdRestart(const std::vector<std::string>& args);
 int cmdWizard(const std::vector<std::string>& args);
+int cmdInstall(const std::vector<std::string>& args);
+int cmdUpgrade(const std::vector<std::string>& args);
+int cmdRepair(const std::vector<std::string>& args);
+int cmdUninstall(const std::vector<std::string>& args);
 extern const char kWizardUsage[];
 
 // The end of an operation: on success "<done> <name>" (and any "worker_msg"); on failure

@@ -121,7 +121,120 @@ const std::vector<Command>& commands() {
          "system says of the job, whether it runs, whether the service is enabled, and the\n"
          "package's own jobs.\n",
          cmdJobs},
+        {"start", "start an installed package, and then the packages that depend on it",
+         "usage: corvpkg start <name> [--user U] [--lang L] [--json]\n"
+         "\n"
+         "Starts the package through its init job pkgctl-<name>: checks the services it\n"
+         "needs, the OS version limits, the architecture and the volumes, asks its\n"
+         "prestart when it has one, acquires its resources, marks it enabled and starts the\n"
+         "job. Then its enabled dependents are started, after it. A failure prints the\n"
+         "result code's name, the reasons and any \"worker_msg\" of its resource workers.\n"
+         "  --user U   the user on whose behalf it starts (gets the package's desktop apps\n"
+         "             when an administrator); default: none\n"
+         "  --lang L   language passed to the package's scripts\n"
+         "Exit status: 0 started, 1 failed (the package's own outcome; a dependent that\n"
+         "fails is logged but does not fail the command), 2 usage error.\n",
+         cmdStart},
+        {"stop", "stop an installed package, after the packages that depend on it",
+         "usage: corvpkg stop <name> [--user U] [--lang L] [--json]\n"
+         "\n"
+         "Stops the running dependents first, then the package: asks its prestop when it\n"
+         "has one, removes its enabled flag, stops the job and releases the resources that\n"
+         "it holds while enabled.\n"
+         "Exit status: 0 stopped, 1 failed, 2 usage error.\n",
+         cmdStop},
+        {"restart", "stop a package with its dependents and start them again",
+         "usage: corvpkg restart <name> [--json]\n"
+         "\n"
+         "A stop as \"corvpkg stop\" and, only when that succeeded, a start as\n"
+         "\"corvpkg start\".\n"
+         "Exit status: 0 restarted, 1 failed, 2 usage error.\n",
+         cmdRestart},
         {"wizard", "show a package's wizard steps or defaults", kWizardUsage, cmdWizard},
+        {"install", "install a package file (or upgrade or repair what is installed)",
+         "usage: corvpkg install <file.cpk> [--volume V] [--no-start] [--answers F.json]\n"
+         "                       [--defaults] [--lang L] [--ignore-dependents] [--no-verify]\n"
+         "                       [--user U] [--json]\n"
+         "\n"
+         "install, upgrade and repair are one entrance: the engine compares the file with\n"
+         "what is installed and installs it fresh, upgrades the installed version (the\n"
+         "same version counts as an upgrade), or repairs a broken installation.\n"
+         "First the installability checks run (architecture, OS version, dependencies,\n"
+         "conflicts, signature); a refusal prints the report. When the package has an\n"
+         "install wizard its questions are printed and must be answered.\n"
+         "  --volume V           the volume for a fresh install (a saved default volume wins)\n"
+         "  --no-start           leave the package stopped afterwards\n"
+         "  --answers F.json     the wizard's answers, a JSON object of key: value\n"
+         "  --defaults           take the wizard's default answers (for those not in F.json)\n"
+         "  --lang L             language of the wizard and messages (default enu)\n"
+         "  --ignore-dependents  upgrade even when running packages depend on this one\n"
+         "  --no-verify          install an unsigned or untrusted file\n"
+         "  --user U             the user on whose behalf it runs\n"
+         "Progress goes to standard error; the outcome names the result code and the\n"
+         "message key, and prints what the scripts left in their message file.\n"
+         "Exit status: 0 done, 1 failed or refused, 2 usage error (also: questions left\n"
+         "unanswered).\n",
+         cmdInstall},
+        {"upgrade", "the same as install: upgrade an installed package from a file",
+         "usage: corvpkg upgrade <file.cpk> [--volume V] [--no-start] [--answers F.json]\n"
+         "                       [--defaults] [--lang L] [--ignore-dependents] [--no-verify]\n"
+         "                       [--user U] [--json]\n"
+         "\n"
+         "install, upgrade and repair are one entrance: the engine compares the file with\n"
+         "what is installed and installs it fresh, upgrades the installed version (the\n"
+         "same version counts as an upgrade), or repairs a broken installation.\n"
+         "First the installability checks run (architecture, OS version, dependencies,\n"
+         "conflicts, signature); a refusal prints the report. When the package has an\n"
+         "install wizard its questions are printed and must be answered.\n"
+         "  --volume V           the volume for a fresh install (a saved default volume wins)\n"
+         "  --no-start           leave the package stopped afterwards\n"
+         "  --answers F.json     the wizard's answers, a JSON object of key: value\n"
+         "  --defaults           take the wizard's default answers (for those not in F.json)\n"
+         "  --lang L             language of the wizard and messages (default enu)\n"
+         "  --ignore-dependents  upgrade even when running packages depend on this one\n"
+         "  --no-verify          install an unsigned or untrusted file\n"
+         "  --user U             the user on whose behalf it runs\n"
+         "Progress goes to standard error; the outcome names the result code and the\n"
+         "message key, and prints what the scripts left in their message file.\n"
+         "Exit status: 0 done, 1 failed or refused, 2 usage error (also: questions left\n"
+         "unanswered).\n",
+         cmdUpgrade},
+        {"repair", "the same as install: repair a broken package from its file",
+         "usage: corvpkg repair <file.cpk> [--volume V] [--no-start] [--answers F.json]\n"
+         "                       [--defaults] [--lang L] [--ignore-dependents] [--no-verify]\n"
+         "                       [--user U] [--json]\n"
+         "\n"
+         "install, upgrade and repair are one entrance: the engine compares the file with\n"
+         "what is installed and installs it fresh, upgrades the installed version (the\n"
+         "same version counts as an upgrade), or repairs a broken installation.\n"
+         "First the installability checks run (architecture, OS version, dependencies,\n"
+         "conflicts, signature); a refusal prints the report. When the package has an\n"
+         "install wizard its questions are printed and must be answered.\n"
+         "  --volume V           the volume for a fresh install (a saved default volume wins)\n"
+         "  --no-start           leave the package stopped afterwards\n"
+         "  --answers F.json     the wizard's answers, a JSON object of key: value\n"
+         "  --defaults           take the wizard's default answers (for those not in F.json)\n"
+         "  --lang L             language of the wizard and messages (default enu)\n"
+         "  --ignore-dependents  upgrade even when running packages depend on this one\n"
+         "  --no-verify          install an unsigned or untrusted file\n"
+         "  --user U             the user on whose behalf it runs\n"
+         "Progress goes to standard error; the outcome names the result code and the\n"
+         "message key, and prints what the scripts left in their message file.\n"
+         "Exit status: 0 done, 1 failed or refused, 2 usage error (also: questions left\n"
+         "unanswered).\n",
+         cmdRepair},
+        {"uninstall", "uninstall a package",
+         "usage: corvpkg uninstall <name> [--force] [--answers F.json] [--lang L] [--user U]\n"
+         "                         [--json]\n"
+         "\n"
+         "Stops the package, runs its preuninst, releases its resources, removes its files\n"
+         "and registry entry, and runs its postuninst. Its settings under\n"
+         "/usr/corv/etc/packages/<name> stay for a later install.\n"
+         "  --force          uninstall even when installed packages depend on it\n"
+         "  --answers F.json the answers of its uninstall wizard, a JSON object\n"
+         "  --lang L         language passed to the package's scripts\n"
+         "Exit status: 0 uninstalled, 1 failed or refused, 2 usage error.\n",
+         cmdUninstall},
     };
     return table;
 }

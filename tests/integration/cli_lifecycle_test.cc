@@ -1,0 +1,166 @@
+// The command line over the whole local life of a package, in the sandbox.
+#include <gtest/gtest.h>
+#include <sys/mount.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <string>
+#include <vector>
+
+#include "corvpkg/json_util.h"
+#include "corvpkg/packagemanager.h"
+#include "corvpkg/pkgvolume.h"
+#include "support/files.h"
+#include "support/lifecycle_kit.h"
+#include "support/pkg_kit.h"
+#include "support/run.h"
+
+using namespace CORVPackageTool;
+using testutil::TestPackage;
+
+namespace {
+
+testutil::RunResult corvpkg(const std::vector<std::string>& args) {
+    return testutil::run(CORVPKG_CLI_PATH, args);
+}
+
+Json::Value json(const testutil::RunResult& r) {
+    Json::Value out;
+    EXPECT_TRUE(fromString(r.out, out)) << r.out << r.err;
+    return out;
+}
+
+int status(const std::string& name) {
+    return PackageManager().getPkgStatus(name);
+}
+
+}  // namespace
+
+TEST(CliLifecycle, InstallReinstallDowngradeUninstall) {
+    const std::string v2 = testutil::buildPackage(testutil::recordingPackage("demo", "2.0-0001"));
+    testutil::RunResult r = corvpkg({"install", v2, "--no-verify"});
+    ASSERT_EQ(r.status, 0) << r.err;
+    EXPECT_EQ(r.out, "installed demo\n");
+    EXPECT_NE(r.err.find("postinst"), std::string::npos) << "progress shows the steps: " << r.err;
+    EXPECT_EQ(status("demo"), 0);
+
+    // The same version again is an upgrade of the package onto itself.
+    testutil::clearRecords("demo");
+    r = corvpkg({"upgrade", v2, "--no-verify"});
+    ASSERT_EQ(r.status, 0) << r.err;
+    EXPECT_EQ(r.out, "upgraded demo\n");
+    EXPECT_EQ(testutil::scriptsRan("demo").front(), "preupgrade");
+
+    const std::string v1 = testutil::buildPackage(testutil::recordingPackage("demo", "1.0-0001"));
+    r = corvpkg({"install", v1, "--no-verify", "--json"});
+    EXPECT_EQ(r.status, 1);
+    Json::Value out = json(r);
+    EXPECT_FALSE(out["success"].asBool());
+    EXPECT_EQ(status("demo"), 0);
+
+    r = corvpkg({"uninstall", "demo"});
+    ASSERT_EQ(r.status, 0) << r.err;
+    EXPECT_EQ(r.out, "uninstalled demo\n");
+    EXPECT_EQ(status("demo"), 255);
+}
+
+TEST(CliLifecycle, InterruptedInstallIsRepaired) {
+    TestPackage pkg = testutil::recordingPackage("demo");
+    // The installer dies after registration, in postinst, as on a power cut.
+    pkg.scripts["postinst"] = "[ -f /tmp/demo.die ] && kill -KILL $PPID\nexit 0\n";
+    const std::string file = testutil::buildPackage(pkg);
+    testutil::writeFile("/tmp/demo.die", "");
+    testutil::RunResult r = corvpkg({"install", file, "--no-verify"});
+    EXPECT_EQ(r.status, 128 + 9);
+    EXPECT_EQ(status("demo"), 150);
+    r = corvpkg({"status", "demo", "--json"});
+    EXPECT_TRUE(json(r)["broken"].asBool());
+
+    unlink("/tmp/demo.die");
+    r = corvpkg({"repair", file, "--no-verify"});
+    ASSERT_EQ(r.status, 0) << r.err;
+    EXPECT_EQ(status("demo"), 0);
+    EXPECT_FALSE(testutil::exists("/var/packages/demo/installing"));
+}
+
+TEST(CliLifecycle, PackageWhoseTargetIsGoneIsRepaired) {
+    const std::string file = testutil::buildPackage(testutil::recordingPackage("demo"));
+    ASSERT_EQ(corvpkg({"install", file, "--no-verify"}).status, 0);
+    testutil::removeAll("/volume1/@appstore/demo");
+    ASSERT_EQ(status("demo"), 150);
+    testutil::RunResult r = corvpkg({"install", file, "--no-verify"});
+    ASSERT_EQ(r.status, 0) << r.err;
+    EXPECT_EQ(status("demo"), 0);
+    EXPECT_TRUE(testutil::exists("/volume1/@appstore/demo/bin/app"));
+}
+
+TEST(CliLifecycle, WizardDefaultsReachTheScripts) {
+    TestPackage pkg = testutil::recordingPackage("demo");
+    pkg.wizard["install_uifile"] =
+        R"([{"step_title":"Setup","items":[{"type":"textfield","subitems":[)"
+        R"({"key":"answer","desc":"The answer","defaultValue":"forty-two"}]}]}])";
+    const std::string file = testutil::buildPackage(pkg);
+    testutil::RunResult r = corvpkg({"install", file, "--no-verify"});
+    EXPECT_EQ(r.status, 2);
+    EXPECT_NE(r.err.find("answer - The answer (default: forty-two)"), std::string::npos) << r.err;
+    EXPECT_EQ(status("demo"), 255);
+
+    r = corvpkg({"install", file, "--no-verify", "--defaults"});
+    ASSERT_EQ(r.status, 0) << r.err;
+    EXPECT_EQ(testutil::scriptField("demo", "postinst", "answer"), "forty-two");
+}
+
+TEST(CliLifecycle, BadInputIsRefusedClearly) {
+    testutil::writeFile("/tmp/answers.txt", "not json");
+    const std::string file = testutil::buildPackage(testutil::recordingPackage("demo"));
+    TestPackage arm = testutil::recordingPackage("arm");
+    arm.info["arch"] = "armv5";
+    const std::string armFile = testutil::buildPackage(arm);
+    ASSERT_EQ(mkdir("/tmp/a-dir", 0755), 0);
+    struct Case {
+        std::vector<std::string> args;
+        const char* name;
+    };
+    const Case cases[] = {
+        {{"install", "/tmp/no-such.cpk"}, "PKG_ERR_FILE_ACCESS"},
+        {{"install", "/tmp/a-dir"}, "PKG_ERR_FILE_ACCESS"},
+        {{"install", file, "--answers", "/tmp/answers.txt"}, "PKG_ERR_BAD_ANSWERS"},
+        {{"install", armFile, "--no-verify"}, "PKG_ERR_PLATFORM"},
+        {{"uninstall", "nosuch"}, "PKG_ERR_NOT_INSTALLED"},
+    };
+    for (const Case& c : cases) {
+        std::vector<std::string> args = c.args;
+        args.push_back("--json");
+        testutil::RunResult r = corvpkg(args);
+        SCOPED_TRACE(c.args[0] + " " + c.args[1]);
+        EXPECT_EQ(r.status, 1) << r.out << r.err;
+        EXPECT_EQ(json(r)["name"].asString(), c.name) << r.out;
+    }
+    EXPECT_EQ(PackageManager().enumPackages(nullptr, PKG_INFO_MASK_ALL).size(), 0u);
+}
+
+TEST(CliLifecycle, SavedDefaultVolumeWinsOverTheOption) {
+    ASSERT_EQ(mkdir("/volume2", 0755), 0);
+    // A default volume must offer 200 MiB to be taken.
+    ASSERT_EQ(mount("tmpfs", "/volume2", "tmpfs", 0, "size=256m"), 0);
+    const std::string file = testutil::buildPackage(testutil::recordingPackage("demo"));
+    testutil::writeFile("/etc/corvinfo.conf", testutil::readFile("/etc/corvinfo.conf") +
+                                                  "pkg_def_intall_vol=\"/volume2\"\n");
+    testutil::RunResult r = corvpkg({"install", file, "--no-verify", "--volume", "/volume1"});
+    ASSERT_EQ(r.status, 0) << r.err;
+    EXPECT_EQ(PMSReadLink("/var/packages/demo/target"), "/volume2/@appstore/demo");
+    umount2("/volume2", MNT_DETACH);
+}
+
+TEST(CliLifecycle, StartStopRestartThroughTheCommandLine) {
+    const std::string file = testutil::buildPackage(testutil::recordingPackage("demo"));
+    ASSERT_EQ(corvpkg({"install", file, "--no-verify", "--no-start"}).status, 0);
+    EXPECT_EQ(status("demo"), 3);
+    EXPECT_EQ(corvpkg({"start", "demo"}).out, "started demo\n");
+    EXPECT_EQ(status("demo"), 0);
+    testutil::clearRecords("demo");
+    EXPECT_EQ(corvpkg({"restart", "demo"}).out, "restarted demo\n");
+    EXPECT_EQ(testutil::startStopActions(), (std::vector<std::string>{"demo stop", "demo start"}));
+    EXPECT_EQ(corvpkg({"stop", "demo"}).out, "stopped demo\n");
+    EXPECT_EQ(status("demo"), 3);
+}

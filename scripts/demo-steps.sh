@@ -1,21 +1,98 @@
 #!/usr/bin/env bash
 # The demo's steps, run inside the sandbox by demo.sh. Argument: the corvpkg program.
+# The whole local life of two example packages (examples/README.md): build, check,
+# install with a wizard, run, upgrade, stop, start, uninstall. The sandbox vanishes
+# afterwards. Exits non-zero when a step does not end as the demo expects.
 set -uo pipefail
 corvpkg=$1
 cd "$(dirname "${BASH_SOURCE[0]}")/.."
+out=/tmp/examples
+failures=0
 
+# step TITLE EXPECTED_STATUS ARGS...: runs corvpkg ARGS and checks its exit status.
 step() {
-    printf '\n==== %s\n$ corvpkg %s\n' "$1" "${*:2}"
-    "$corvpkg" "${@:2}"
-    printf '(exit status %d)\n' "$?"
+    local title=$1 expected=$2
+    shift 2
+    printf '\n==== %s\n$ corvpkg %s\n' "$title" "$*"
+    "$corvpkg" "$@"
+    local status=$?
+    printf '(exit status %d)\n' "$status"
+    if [ "$status" -ne "$expected" ]; then
+        printf '!!!! expected exit status %d\n' "$expected"
+        failures=$((failures + 1))
+    fi
 }
 
-step "Version of the command line" --version
-step "This machine: OS, architecture, volumes, temporary space" system --size 1048576
-step "What the example package declares" info examples/hello --lang ger
-step "Build the package file" build examples/hello -o /tmp/hello.cpk
-step "Look inside the file without installing it" inspect /tmp/hello.cpk
-step "Ask whether it can be installed (the maker has not signed it)" check /tmp/hello.cpk
-step "Installed packages" list
-step "Versions compare number by number" version-compare 1.10-0002 '>' 1.9-0045
-printf '\n==== Demo finished\n'
+# ask TITLE PORT EXPECTED_TEXT: one HTTP request to a daemon on the loopback interface,
+# with bash's own /dev/tcp (no curl on the machine needed).
+ask() {
+    local title=$1 port=$2 expected=$3 answer
+    printf '\n==== %s\n$ GET http://127.0.0.1:%s/\n' "$title" "$port"
+    answer=$(timeout 5 bash -c "exec 3<>/dev/tcp/127.0.0.1/$port &&
+        printf 'GET / HTTP/1.0\r\nHost: localhost\r\n\r\n' >&3 && cat <&3" 2>&1 | tr -d '\r')
+    printf '%s\n' "$answer" | sed -n '/^$/,$p' | sed '1d'
+    if [ -n "$expected" ] && ! printf '%s' "$answer" | grep -qF -- "$expected"; then
+        printf '!!!! expected an answer with "%s"\n' "$expected"
+        failures=$((failures + 1))
+    elif [ -z "$expected" ] && [ -n "$answer" ] && ! printf '%s' "$answer" | grep -q refused; then
+        printf '!!!! expected no answer\n'
+        failures=$((failures + 1))
+    fi
+}
+
+show() {
+    printf '\n==== %s\n$ %s\n' "$1" "$2"
+    bash -c "$2"
+}
+
+step "Version of the command line" 0 --version
+step "This machine: OS, architecture, volumes" 0 system
+show "Build the example packages with 'corvpkg build'" \
+    "sh examples/build.sh '$corvpkg' $out && ls -l $out"
+step "Look inside a package file" 0 inspect $out/greeter-1.0.0-0001.cpk
+step "Can it be installed? greeter needs hello running, and nobody signed the files" 1 \
+    check $out/greeter-1.0.0-0001.cpk
+
+step "Install hello (unsigned, hence --no-verify); it starts after the install" 0 \
+    install $out/hello-1.0.0-0001.cpk --no-verify
+ask "hello's daemon answers" 8765 "hello from a corvpkg package"
+
+step "greeter's install wizard asks two questions" 0 wizard $out/greeter-1.0.0-0001.cpk
+step "Installing without answers is refused with the questions" 2 \
+    install $out/greeter-1.0.0-0001.cpk --no-verify
+show "Our answers" "printf '%s\n' '{\"GREETER_GREETING\": \"Hello from the demo\", \"GREETER_PORT\": \"9123\"}' >/tmp/answers.json && cat /tmp/answers.json"
+step "Install greeter with the answers: its user, its job, its cron job" 0 \
+    install $out/greeter-1.0.0-0001.cpk --no-verify --answers /tmp/answers.json
+step "Installed packages" 0 list
+step "greeter's status" 0 status greeter
+step "What greeter needs and what needs hello" 0 deps hello
+ask "greeter answers with our greeting and what hello says" 9123 "Hello from the demo"
+show "greeter runs as its own user" "ps -o user=,args= -C perl | grep greeter || true"
+
+step "Upgrade greeter to 1.1.0-0001: the settings come across" 0 \
+    upgrade $out/greeter-1.1.0-0001.cpk --no-verify
+ask "greeter 1.1.0 answers, with the greeting chosen at install" 9123 "greeter 1.1.0-0001"
+step "A downgrade is refused" 1 install $out/greeter-1.0.0-0001.cpk --no-verify --defaults
+
+step "Stop hello: greeter, which depends on it, stops first" 0 stop hello
+step "Installed packages" 0 list
+ask "greeter no longer answers" 9123 ""
+step "Start hello" 0 start hello
+step "Start greeter" 0 start greeter
+ask "greeter answers again" 9123 "Hello from the demo"
+step "Restart greeter" 0 restart greeter
+step "greeter's own log" 0 log greeter
+
+step "hello cannot go while greeter depends on it" 1 uninstall hello
+step "Uninstall greeter" 0 uninstall greeter
+step "Uninstall hello" 0 uninstall hello
+step "Installed packages" 0 list
+show "What greeter's scripts recorded (the record outlives the package)" \
+    "cut -d' ' -f3- /usr/corv/etc/packages/greeter/scripts.log"
+show "The system event log" "cut -f2- /var/log/corvevents.log"
+
+if [ "$failures" -ne 0 ]; then
+    printf '\n==== Demo finished with %d unexpected outcome(s)\n' "$failures"
+    exit 1
+fi
+printf '\n==== Demo finished: every step ended as expected\n'

@@ -84,18 +84,28 @@ int parseSingle(const std::vector<std::string>& args, const char* command, const
 int printFailure(bool json, int code, const std::string& reason, const Json::Value& data) {
     const CORVPackageTool::PKG_ERRCODE_INFO* info = CORVPackageTool::PMSGetErrCodeInfo(code);
     const char* name = info ? info->name : "PKG_ERR_UNKNOWN";
+    // The key the desktop would translate for this failure, so scripts can do the same.
+    const char* key = info ? (info->installMsg ? info->installMsg : info->checkReport) : nullptr;
+    // Some failures log nothing of their own: the code's meaning still says what happened.
+    const std::string text = !reason.empty() || !info ? reason : info->meaning;
     if (json) {
         Json::Value out(Json::objectValue);
         out["success"] = false;
         out["code"] = code;
         out["name"] = name;
-        out["reason"] = reason;
+        out["reason"] = text;
+        if (key) {
+            out["message_key"] = key;
+        }
         if (!data.isNull()) {
             out["data"] = data;
         }
         printf("%s\n", CORVPackageTool::toString(out).c_str());
     } else {
-        fprintf(stderr, "error: %s (%d): %s\n", name, code, reason.c_str());
+        fprintf(stderr, "error: %s (%d): %s\n", name, code, text.c_str());
+        if (key) {
+            fprintf(stderr, "message key: %s\n", key);
+        }
         if (!data.isNull()) {
             fprintf(stderr, "data: %s\n", CORVPackageTool::toString(data).c_str());
         }

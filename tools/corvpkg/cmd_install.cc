@@ -1,6 +1,7 @@
 // corvpkg install (and its other names upgrade and repair) and uninstall: the local life
 // of a package file.
 #include <stdio.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <atomic>
@@ -43,6 +44,11 @@ class ProgressWatcher {
     ProgressWatcher& operator=(const ProgressWatcher&) = delete;
 
   private:
+    static bool endedWell(const std::string& message) {
+        static const std::string kOk = " ret=[0]";
+        return message.find(" End ") != std::string::npos && message.size() >= kOk.size() &&
+               message.compare(message.size() - kOk.size(), kOk.size(), kOk) == 0;
+    }
     void loop() {
         while (!stop_) {
             poll();
@@ -55,10 +61,13 @@ class ProgressWatcher {
             std::string line;
             while (std::getline(log, line)) {
                 offset_ += static_cast<long long>(line.size()) + 1;
-                // "<time>\t<message>"; only the message says what happens.
+                // "<time>\t<message>"; only the message says what happens. A command
+                // that ended well was already shown when it began.
                 size_t tab = line.find('\t');
-                fprintf(stderr, "  %s\n",
-                        tab == std::string::npos ? line.c_str() : line.c_str() + tab + 1);
+                const std::string message = tab == std::string::npos ? line : line.substr(tab + 1);
+                if (!endedWell(message)) {
+                    fprintf(stderr, "  %s\n", message.c_str());
+                }
             }
         }
         std::ifstream file(progress_);
@@ -76,6 +85,27 @@ class ProgressWatcher {
     std::atomic<bool> stop_{false};
     std::thread thread_;
 };
+
+// When and how a file was last written; all zero when it does not exist.
+struct FileStamp {
+    long long seconds = 0;
+    long long nanoseconds = 0;
+    long long size = -1;
+    bool operator!=(const FileStamp& other) const {
+        return seconds != other.seconds || nanoseconds != other.nanoseconds || size != other.size;
+    }
+};
+
+FileStamp stampOf(const std::string& path) {
+    struct stat st {};
+    FileStamp stamp;
+    if (stat(path.c_str(), &st) == 0) {
+        stamp.seconds = st.st_mtim.tv_sec;
+        stamp.nanoseconds = st.st_mtim.tv_nsec;
+        stamp.size = st.st_size;
+    }
+    return stamp;
+}
 
 // The answers of --answers F.json: a JSON object. False when the file does not read as one.
 bool readAnswers(const std::string& path, Json::Value& answers) {
@@ -191,7 +221,10 @@ int installCommand(const std::vector<std::string>& args, const char* command) {
         }
     }
 
-    // 3.
+    // 3. The message file may hold the words of an earlier operation: only a file that
+    // this one wrote is the package's message now.
+    const std::string messageFile = pm.getFixedLogFilePath(info.package);
+    const FileStamp before = stampOf(messageFile);
     const bool wasInstalled = PMSCheckPackage(info.package);
     int outcome = 0;
     {
@@ -202,7 +235,9 @@ int installCommand(const std::vector<std::string>& args, const char* command) {
                              lang.c_str(), opts.has("--ignore-dependents"), verify);
     }
     std::string message;
-    PMReadFile(pm.getFixedLogFilePath(info.package).c_str(), 0x10000, message, nullptr);
+    if (stampOf(messageFile) != before) {
+        PMReadFile(messageFile.c_str(), 0x10000, message, nullptr);
+    }
     if (!message.empty() && !opts.json) {
         fprintf(stderr, "message from the package: %s\n", message.c_str());
     }

@@ -2,6 +2,7 @@
 #include <stdio.h>
 
 #include <string>
+#include <vector>
 
 #include "cli.h"
 #include "corvpkg/corvpkg.h"
@@ -75,6 +76,16 @@ int startStop(const std::vector<std::string>& args, const char* command, bool st
         return printFailure(opts.json, PKG_ERR_NOT_INSTALLED, name + " is not installed");
     }
     const char* language = opts.lang.empty() ? nullptr : opts.lang.c_str();
+    // A stop takes the running dependents along; say which, in the order they go.
+    std::string dependents;
+    std::vector<std::string> order;
+    if (!start && pm.getDependencyOrder(name.c_str(), order, false)) {
+        for (const std::string& entry : order) {
+            if (entry != name) {
+                dependents += (dependents.empty() ? "" : ", ") + entry;
+            }
+        }
+    }
     int outcome = 0;
     if (restart) {
         outcome = pm.serviceControlRestart(name);
@@ -83,8 +94,14 @@ int startStop(const std::vector<std::string>& args, const char* command, bool st
             pm.serviceControl(static_cast<PKG_INSTALLATION_TYPE>(start ? 8 : 0x10), name, start,
                               language, optionalText(opts, "--user"), nullptr, true, true);
     }
-    return printOperationOutcome(
+    int status = printOperationOutcome(
         opts, pm, outcome, restart ? "restarted" : (start ? "started" : "stopped"), name, log);
+    if (status == EXIT_OK && !opts.json && !dependents.empty()) {
+        printf("with the dependents that ran, %s: %s\n",
+               restart ? "stopped before it and started after it" : "stopped before it",
+               dependents.c_str());
+    }
+    return status;
 }
 
 }  // namespace

@@ -37,11 +37,15 @@ int status(const std::string& name) {
 }  // namespace
 
 TEST(CliLifecycle, InstallReinstallDowngradeUninstall) {
-    const std::string v2 = testutil::buildPackage(testutil::recordingPackage("demo", "2.0-0001"));
+    TestPackage pkg = testutil::recordingPackage("demo", "2.0-0001");
+    pkg.scripts["postinst"] =
+        "echo 'Ready on port 9.' > \"$CORVPKG_TEMP_LOGFILE\"\n" + pkg.scripts["postinst"];
+    const std::string v2 = testutil::buildPackage(pkg);
     testutil::RunResult r = corvpkg({"install", v2, "--no-verify"});
     ASSERT_EQ(r.status, 0) << r.err;
     EXPECT_EQ(r.out, "installed demo\n");
     EXPECT_NE(r.err.find("postinst"), std::string::npos) << "progress shows the steps: " << r.err;
+    EXPECT_NE(r.err.find("message from the package: Ready on port 9."), std::string::npos) << r.err;
     EXPECT_EQ(status("demo"), 0);
 
     // The same version again is an upgrade of the package onto itself.
@@ -56,7 +60,14 @@ TEST(CliLifecycle, InstallReinstallDowngradeUninstall) {
     EXPECT_EQ(r.status, 1);
     Json::Value out = json(r);
     EXPECT_FALSE(out["success"].asBool());
+    EXPECT_EQ(out["name"].asString(), "PKG_ERR_DOWNGRADE");
+    EXPECT_EQ(out["message_key"].asString(), "pkgmgr:downgrade_version");
+    EXPECT_EQ(out["data"]["oldver"].asString(), "1.0-0001");
+    EXPECT_EQ(out["data"]["curver"].asString(), "2.0-0001");
     EXPECT_EQ(status("demo"), 0);
+    // The message of the earlier install is not this refusal's.
+    r = corvpkg({"install", v1, "--no-verify"});
+    EXPECT_EQ(r.err.find("message from the package"), std::string::npos) << r.err;
 
     r = corvpkg({"uninstall", "demo"});
     ASSERT_EQ(r.status, 0) << r.err;
@@ -150,6 +161,22 @@ TEST(CliLifecycle, SavedDefaultVolumeWinsOverTheOption) {
     ASSERT_EQ(r.status, 0) << r.err;
     EXPECT_EQ(PMSReadLink("/var/packages/demo/target"), "/volume2/@appstore/demo");
     umount2("/volume2", MNT_DETACH);
+}
+
+TEST(CliLifecycle, StopNamesTheDependentsItTookAlong) {
+    TestPackage base = testutil::recordingPackage("base");
+    TestPackage app = testutil::recordingPackage("app");
+    app.info["install_dep_packages"] = "base";
+    ASSERT_EQ(corvpkg({"install", testutil::buildPackage(base), "--no-verify"}).status, 0);
+    ASSERT_EQ(corvpkg({"install", testutil::buildPackage(app), "--no-verify"}).status, 0);
+    testutil::RunResult r = corvpkg({"stop", "base"});
+    ASSERT_EQ(r.status, 0) << r.err;
+    EXPECT_EQ(r.out, "stopped base\nwith the dependents that ran, stopped before it: app\n");
+    EXPECT_EQ(status("app"), 3);
+    r = corvpkg({"uninstall", "base", "--json"});
+    EXPECT_EQ(r.status, 1);
+    EXPECT_EQ(json(r)["name"].asString(), "PKG_ERR_DEPENDENCY");
+    EXPECT_FALSE(json(r)["reason"].asString().empty());
 }
 
 TEST(CliLifecycle, StartStopRestartThroughTheCommandLine) {

@@ -163,6 +163,21 @@ TEST(CliLifecycle, SavedDefaultVolumeWinsOverTheOption) {
     umount2("/volume2", MNT_DETACH);
 }
 
+TEST(CliLifecycle, RepairAfterItsVolumeIsGoneMovesToAnother) {
+    ASSERT_EQ(mkdir("/volume2", 0755), 0);
+    ASSERT_EQ(mount("tmpfs", "/volume2", "tmpfs", 0, "size=64m"), 0);
+    const std::string file = testutil::buildPackage(testutil::recordingPackage("demo"));
+    ASSERT_EQ(corvpkg({"install", file, "--no-verify", "--volume", "/volume2"}).status, 0);
+    ASSERT_EQ(PMSReadLink("/var/packages/demo/target"), "/volume2/@appstore/demo");
+    ASSERT_EQ(umount2("/volume2", MNT_DETACH), 0);
+    EXPECT_EQ(status("demo"), 150);
+
+    testutil::RunResult r = corvpkg({"repair", file, "--no-verify", "--volume", "/volume1"});
+    ASSERT_EQ(r.status, 0) << r.out << r.err;
+    EXPECT_EQ(PMSReadLink("/var/packages/demo/target"), "/volume1/@appstore/demo");
+    EXPECT_EQ(status("demo"), 0);
+}
+
 TEST(CliLifecycle, StopNamesTheDependentsItTookAlong) {
     TestPackage base = testutil::recordingPackage("base");
     TestPackage app = testutil::recordingPackage("app");

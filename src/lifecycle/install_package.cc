@@ -77,6 +77,58 @@ bool PMSRunLogged(const PackageInfo& info, PKG_INSTALLATION_TYPE type,
     return PMSRunAndWriteScriptLog(info, type, runner, -1) == 0;
 }
 
+bool PMSUnpackAndCheck(PackageManager& pm, PKG_INSTALLATION_TYPE type, InstallCommands& cmd,
+                       const std::string& cpkPath, const std::string& workDir, PackageInfo& info,
+                       bool nameTheDir) {
+    // 2.
+    if (!PackageManager::ExLock(180)) {
+        pm.setResult(PKG_ERR_LOCKED);
+        return false;
+    }
+    // 3.
+    PMSRunLogged(info, type, cmd.removeWorkDir);
+    if (!PMSRunLogged(info, type, cmd.makeWorkDir)) {
+        CORV_LOG_ERR("Failed to create install dir %s", workDir.c_str());
+        pm.setResult(PKG_ERR_SYSTEM);
+        return false;
+    }
+    // 4.
+    if (!PMSRunLogged(info, type, cmd.extractAll)) {
+        CORV_LOG_ERR("Failed to extract package, %s", cpkPath.c_str());
+        pm.setResult(PKG_ERR_BAD_ARCHIVE);
+        return false;
+    }
+    // 5.
+    if (!PMSLoadPKGInfoFile(workDir, info, nullptr, kInstallInfoMask)) {
+        if (nameTheDir) {
+            CORV_LOG_ERR("Failed to validate package INFO in %s", workDir.c_str());
+        } else {
+            CORV_LOG_ERR("Failed to validate package INFO");
+        }
+        pm.setResult(PKG_ERR_BAD_ARCHIVE);
+        return false;
+    }
+    // 6.
+    if (!PMSCheckPackageArchModelMatched(info)) {
+        CORV_LOG_ERR("Unsupported system arch");
+        pm.setResult(PKG_ERR_ARCH_MISMATCH);
+        return false;
+    }
+    // 7.
+    if (!pm.CanPackageStartInThisFirmware(info)) {
+        CORV_LOG_ERR("Cannot start package [%s], version %s in this NOS version",
+                     info.package.c_str(), info.version.c_str());
+        return false;
+    }
+    // 8.
+    if (access((workDir + "/package.tgz").c_str(), F_OK) != 0) {
+        CORV_LOG_ERR("Failed to locate %s/package.tgz", workDir.c_str());
+        pm.setResult(PKG_ERR_BAD_ARCHIVE);
+        return false;
+    }
+    return true;
+}
+
 bool PMSInfoFileUsable(const std::string& workDir) {
     struct stat st {};
     return stat((workDir + "/INFO").c_str(), &st) == 0 && st.st_size > 0;
@@ -203,46 +255,8 @@ int PackageManager::install_package(const std::string& cpkPath, const std::strin
 
     // 1.
     InstallCommands cmd(cpkPath, workDir);
-    // 2.
-    if (!ExLock(180)) {
-        setResult(PKG_ERR_LOCKED);
-        goto final;
-    }
-    // 3.
-    PMSRunLogged(info, type, cmd.removeWorkDir);
-    if (!PMSRunLogged(info, type, cmd.makeWorkDir)) {
-        CORV_LOG_ERR("Failed to create install dir %s", workDir.c_str());
-        setResult(PKG_ERR_SYSTEM);
-        goto final;
-    }
-    // 4.
-    if (!PMSRunLogged(info, type, cmd.extractAll)) {
-        CORV_LOG_ERR("Failed to extract package, %s", cpkPath.c_str());
-        setResult(PKG_ERR_BAD_ARCHIVE);
-        goto final;
-    }
-    // 5.
-    if (!PMSLoadPKGInfoFile(workDir, info, nullptr, kInstallInfoMask)) {
-        CORV_LOG_ERR("Failed to validate package INFO in %s", workDir.c_str());
-        setResult(PKG_ERR_BAD_ARCHIVE);
-        goto final;
-    }
-    // 6.
-    if (!PMSCheckPackageArchModelMatched(info)) {
-        CORV_LOG_ERR("Unsupported system arch");
-        setResult(PKG_ERR_ARCH_MISMATCH);
-        goto final;
-    }
-    // 7.
-    if (!CanPackageStartInThisFirmware(info)) {
-        CORV_LOG_ERR("Cannot start package [%s], version %s in this NOS version",
-                     info.package.c_str(), info.version.c_str());
-        goto final;
-    }
-    // 8.
-    if (access((workDir + "/package.tgz").c_str(), F_OK) != 0) {
-        CORV_LOG_ERR("Failed to locate %s/package.tgz", workDir.c_str());
-        setResult(PKG_ERR_BAD_ARCHIVE);
+    // 2-8.
+    if (!PMSUnpackAndCheck(*this, type, cmd, cpkPath, workDir, info, true)) {
         goto final;
     }
     // 9.

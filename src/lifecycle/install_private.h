@@ -9,6 +9,7 @@
 
 #include "corv/pkgutils.h"
 #include "corv/process_runner.h"
+#include "corvpkg/packagemanager.h"
 #include "corvpkg/pkginfo.h"
 #include "corvpkg/pkgtypes.h"
 
@@ -25,6 +26,14 @@ struct InstallCommands {
     CORVUtils::ProcessRunner extractAll;
     CORVUtils::ProcessRunner extractPayload;
 };
+
+// The first steps of an installation and of an upgrade: lock, unpack the package file
+// into `workDir`, read and check its INFO into `info` (architecture, version limits,
+// the payload archive). False with the result set on `pm` (logged). `nameTheDir`: the log
+// line of an unreadable INFO names the work directory (the installation's wording).
+bool PMSUnpackAndCheck(PackageManager& pm, PKG_INSTALLATION_TYPE type, InstallCommands& cmd,
+                       const std::string& cpkPath, const std::string& workDir, PackageInfo& info,
+                       bool nameTheDir);
 
 // What the install scripts of one operation share.
 struct ScriptContext {

@@ -99,39 +99,7 @@ int PackageManager::upgrade_package(const std::string& cpkPath, const std::strin
     InstallCommands cmd(cpkPath, workDir);
 
     // 1. As an installation: lock, unpack, check the new record.
-    if (!ExLock(180)) {
-        setResult(PKG_ERR_LOCKED);
-        goto final;
-    }
-    PMSRunLogged(newInfo, type, cmd.removeWorkDir);
-    if (!PMSRunLogged(newInfo, type, cmd.makeWorkDir)) {
-        CORV_LOG_ERR("Failed to create install dir %s", workDir.c_str());
-        setResult(PKG_ERR_SYSTEM);
-        goto final;
-    }
-    if (!PMSRunLogged(newInfo, type, cmd.extractAll)) {
-        CORV_LOG_ERR("Failed to extract package, %s", cpkPath.c_str());
-        setResult(PKG_ERR_BAD_ARCHIVE);
-        goto final;
-    }
-    if (!PMSLoadPKGInfoFile(workDir, newInfo, nullptr, kInstallInfoMask)) {
-        CORV_LOG_ERR("Failed to validate package INFO");
-        setResult(PKG_ERR_BAD_ARCHIVE);
-        goto final;
-    }
-    if (!PMSCheckPackageArchModelMatched(newInfo)) {
-        CORV_LOG_ERR("Unsupported system arch");
-        setResult(PKG_ERR_ARCH_MISMATCH);
-        goto final;
-    }
-    if (!CanPackageStartInThisFirmware(newInfo)) {
-        CORV_LOG_ERR("Cannot start package [%s], version %s in this NOS version",
-                     newInfo.package.c_str(), newInfo.version.c_str());
-        goto final;
-    }
-    if (access((workDir + "/package.tgz").c_str(), F_OK) != 0) {
-        CORV_LOG_ERR("Failed to locate %s/package.tgz", workDir.c_str());
-        setResult(PKG_ERR_BAD_ARCHIVE);
+    if (!PMSUnpackAndCheck(*this, type, cmd, cpkPath, workDir, newInfo, false)) {
         goto final;
     }
     name = newInfo.package;

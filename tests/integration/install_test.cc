@@ -23,22 +23,12 @@
 using namespace CORVPackageTool;
 using testutil::TestPackage;
 
+using testutil::modeOf;
+using testutil::ownerOf;
+
 namespace {
 
 const std::vector<std::string> kInstallScripts = {"preinst", "postinst"};
-
-mode_t modeOf(const std::string& path) {
-    struct stat st {};
-    return lstat(path.c_str(), &st) == 0 ? (st.st_mode & 07777) : 0;
-}
-
-std::string ownerOf(const std::string& path) {
-    struct stat st {};
-    if (lstat(path.c_str(), &st) != 0) {
-        return "";
-    }
-    return std::to_string(st.st_uid) + ":" + std::to_string(st.st_gid);
-}
 
 // The scripted plug-in twice: as worker "early" of the phase before preinst, and as
 // "late" of the phase after registration.

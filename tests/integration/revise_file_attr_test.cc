@@ -20,20 +20,10 @@
 using namespace CORVPackageTool;
 using namespace CORVPackageTool::Privilege;
 
+using testutil::modeOf;
+using testutil::ownerOf;
+
 namespace {
-
-mode_t modeOf(const std::string& path) {
-    struct stat st {};
-    return lstat(path.c_str(), &st) == 0 ? (st.st_mode & 07777) : 0;
-}
-
-std::string ownerOf(const std::string& path) {
-    struct stat st {};
-    if (lstat(path.c_str(), &st) != 0) {
-        return "";
-    }
-    return std::to_string(st.st_uid) + ":" + std::to_string(st.st_gid);
-}
 
 std::string makeFile(const std::string& path, mode_t mode) {
     testutil::writeFile(path, "#!/bin/sh\n");

@@ -2,6 +2,7 @@
 
 #include <stdio.h>
 #include <stdlib.h>
+#include <sys/stat.h>
 
 #include <filesystem>
 #include <fstream>
@@ -49,6 +50,19 @@ std::string infoText(const std::vector<std::pair<std::string, std::string>>& key
         text += key + "=\"" + value + "\"\n";
     }
     return text;
+}
+
+mode_t modeOf(const std::string& path) {
+    struct stat st {};
+    return lstat(path.c_str(), &st) == 0 ? (st.st_mode & 07777) : 0;
+}
+
+std::string ownerOf(const std::string& path) {
+    struct stat st {};
+    if (lstat(path.c_str(), &st) != 0) {
+        return "";
+    }
+    return std::to_string(st.st_uid) + ":" + std::to_string(st.st_gid);
 }
 
 }  // namespace testutil

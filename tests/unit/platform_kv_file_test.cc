@@ -17,6 +17,8 @@
 using testutil::readFile;
 using testutil::writeFile;
 
+using testutil::modeOf;
+
 namespace {
 
 // The owners of what the platform allocates, for the tests.
@@ -65,11 +67,6 @@ std::vector<std::string> filesIn(const std::string& dir) {
         closedir(d);
     }
     return names;
-}
-
-mode_t modeOf(const std::string& path) {
-    struct stat st {};
-    return stat(path.c_str(), &st) == 0 ? (st.st_mode & 07777) : 0;
 }
 
 const char* kMissing = nullptr;

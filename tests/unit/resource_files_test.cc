@@ -17,12 +17,9 @@
 using namespace CORVPackageTool;
 using namespace CORVPackageTool::Resource;
 
-namespace {
+using testutil::modeOf;
 
-mode_t modeOf(const std::string& path) {
-    struct stat st {};
-    return stat(path.c_str(), &st) == 0 ? (st.st_mode & 07777) : 0;
-}
+namespace {
 
 class Logged {
   public:

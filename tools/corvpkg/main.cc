@@ -10,6 +10,36 @@
 
 namespace cli {
 
+namespace {
+
+// install, upgrade and repair are one command under three names.
+const char kInstallUsage[] =
+    "usage: corvpkg install|upgrade|repair <file.cpk>\n"
+    "               [--volume V] [--no-start] [--answers F.json]\n"
+    "               [--defaults] [--lang L] [--ignore-dependents] [--no-verify]\n"
+    "               [--user U] [--json]\n"
+    "\n"
+    "install, upgrade and repair are one entrance: the engine compares the file with\n"
+    "what is installed and installs it fresh, upgrades the installed version (the\n"
+    "same version counts as an upgrade), or repairs a broken installation.\n"
+    "First the installability checks run (architecture, OS version, dependencies,\n"
+    "conflicts, signature); a refusal prints the report. When the package has an\n"
+    "install wizard its questions are printed and must be answered.\n"
+    "  --volume V           the volume for a fresh install (a saved default volume wins)\n"
+    "  --no-start           leave the package stopped afterwards\n"
+    "  --answers F.json     the wizard's answers, a JSON object of key: value\n"
+    "  --defaults           take the wizard's default answers (for those not in F.json)\n"
+    "  --lang L             language of the wizard and messages (default enu)\n"
+    "  --ignore-dependents  upgrade even when running packages depend on this one\n"
+    "  --no-verify          install an unsigned or untrusted file\n"
+    "  --user U             the user on whose behalf it runs\n"
+    "Progress goes to standard error; the outcome names the result code and the\n"
+    "message key, and prints what the scripts left in their message file.\n"
+    "Exit status: 0 done, 1 failed or refused, 2 usage error (also: questions left\n"
+    "unanswered).\n";
+
+}  // namespace
+
 const std::vector<Command>& commands() {
     static const std::vector<Command> table = {
         {"info", "show a package directory's INFO as the engine reads it",
@@ -152,76 +182,10 @@ const std::vector<Command>& commands() {
          cmdRestart},
         {"wizard", "show a package's wizard steps or defaults", kWizardUsage, cmdWizard},
         {"install", "install a package file (or upgrade or repair what is installed)",
-         "usage: corvpkg install <file.cpk> [--volume V] [--no-start] [--answers F.json]\n"
-         "                       [--defaults] [--lang L] [--ignore-dependents] [--no-verify]\n"
-         "                       [--user U] [--json]\n"
-         "\n"
-         "install, upgrade and repair are one entrance: the engine compares the file with\n"
-         "what is installed and installs it fresh, upgrades the installed version (the\n"
-         "same version counts as an upgrade), or repairs a broken installation.\n"
-         "First the installability checks run (architecture, OS version, dependencies,\n"
-         "conflicts, signature); a refusal prints the report. When the package has an\n"
-         "install wizard its questions are printed and must be answered.\n"
-         "  --volume V           the volume for a fresh install (a saved default volume wins)\n"
-         "  --no-start           leave the package stopped afterwards\n"
-         "  --answers F.json     the wizard's answers, a JSON object of key: value\n"
-         "  --defaults           take the wizard's default answers (for those not in F.json)\n"
-         "  --lang L             language of the wizard and messages (default enu)\n"
-         "  --ignore-dependents  upgrade even when running packages depend on this one\n"
-         "  --no-verify          install an unsigned or untrusted file\n"
-         "  --user U             the user on whose behalf it runs\n"
-         "Progress goes to standard error; the outcome names the result code and the\n"
-         "message key, and prints what the scripts left in their message file.\n"
-         "Exit status: 0 done, 1 failed or refused, 2 usage error (also: questions left\n"
-         "unanswered).\n",
-         cmdInstall},
-        {"upgrade", "the same as install: upgrade an installed package from a file",
-         "usage: corvpkg upgrade <file.cpk> [--volume V] [--no-start] [--answers F.json]\n"
-         "                       [--defaults] [--lang L] [--ignore-dependents] [--no-verify]\n"
-         "                       [--user U] [--json]\n"
-         "\n"
-         "install, upgrade and repair are one entrance: the engine compares the file with\n"
-         "what is installed and installs it fresh, upgrades the installed version (the\n"
-         "same version counts as an upgrade), or repairs a broken installation.\n"
-         "First the installability checks run (architecture, OS version, dependencies,\n"
-         "conflicts, signature); a refusal prints the report. When the package has an\n"
-         "install wizard its questions are printed and must be answered.\n"
-         "  --volume V           the volume for a fresh install (a saved default volume wins)\n"
-         "  --no-start           leave the package stopped afterwards\n"
-         "  --answers F.json     the wizard's answers, a JSON object of key: value\n"
-         "  --defaults           take the wizard's default answers (for those not in F.json)\n"
-         "  --lang L             language of the wizard and messages (default enu)\n"
-         "  --ignore-dependents  upgrade even when running packages depend on this one\n"
-         "  --no-verify          install an unsigned or untrusted file\n"
-         "  --user U             the user on whose behalf it runs\n"
-         "Progress goes to standard error; the outcome names the result code and the\n"
-         "message key, and prints what the scripts left in their message file.\n"
-         "Exit status: 0 done, 1 failed or refused, 2 usage error (also: questions left\n"
-         "unanswered).\n",
+         kInstallUsage, cmdInstall},
+        {"upgrade", "the same as install: upgrade an installed package from a file", kInstallUsage,
          cmdUpgrade},
-        {"repair", "the same as install: repair a broken package from its file",
-         "usage: corvpkg repair <file.cpk> [--volume V] [--no-start] [--answers F.json]\n"
-         "                       [--defaults] [--lang L] [--ignore-dependents] [--no-verify]\n"
-         "                       [--user U] [--json]\n"
-         "\n"
-         "install, upgrade and repair are one entrance: the engine compares the file with\n"
-         "what is installed and installs it fresh, upgrades the installed version (the\n"
-         "same version counts as an upgrade), or repairs a broken installation.\n"
-         "First the installability checks run (architecture, OS version, dependencies,\n"
-         "conflicts, signature); a refusal prints the report. When the package has an\n"
-         "install wizard its questions are printed and must be answered.\n"
-         "  --volume V           the volume for a fresh install (a saved default volume wins)\n"
-         "  --no-start           leave the package stopped afterwards\n"
-         "  --answers F.json     the wizard's answers, a JSON object of key: value\n"
-         "  --defaults           take the wizard's default answers (for those not in F.json)\n"
-         "  --lang L             language of the wizard and messages (default enu)\n"
-         "  --ignore-dependents  upgrade even when running packages depend on this one\n"
-         "  --no-verify          install an unsigned or untrusted file\n"
-         "  --user U             the user on whose behalf it runs\n"
-         "Progress goes to standard error; the outcome names the result code and the\n"
-         "message key, and prints what the scripts left in their message file.\n"
-         "Exit status: 0 done, 1 failed or refused, 2 usage error (also: questions left\n"
-         "unanswered).\n",
+        {"repair", "the same as install: repair a broken package from its file", kInstallUsage,
          cmdRepair},
         {"uninstall", "uninstall a package",
          "usage: corvpkg uninstall <name> [--force] [--answers F.json] [--lang L] [--user U]\n"

@@ -58,14 +58,8 @@ bool enabled(const std::string& name) {
     return testutil::exists("/var/packages/" + name + "/enabled");
 }
 
-void clearLog() {
-    unlink(kLog);
-    unlink(kPluginLog);
-}
-
-}  // namespace
-
-TEST(StartStop, ChainStopsDependentsFirstAndStartsThemAfter) {
+// "app" depends on "base"; both installed and started.
+void startChain() {
     testutil::TestPackage base = startable("base");
     testutil::TestPackage app = startable("app");
     app.info["install_dep_packages"] = "base";
@@ -75,6 +69,18 @@ TEST(StartStop, ChainStopsDependentsFirstAndStartsThemAfter) {
     ASSERT_EQ(pm.serviceControl(kUserStart, "base", true, nullptr, nullptr, nullptr, true, true),
               1);
     ASSERT_EQ(pm.serviceControl(kUserStart, "app", true, nullptr, nullptr, nullptr, true, true), 1);
+}
+
+void clearLog() {
+    unlink(kLog);
+    unlink(kPluginLog);
+}
+
+}  // namespace
+
+TEST(StartStop, ChainStopsDependentsFirstAndStartsThemAfter) {
+    ASSERT_NO_FATAL_FAILURE(startChain());
+    PackageManager pm;
     EXPECT_EQ(pm.getPkgStatus("app"), 0);
 
     clearLog();
@@ -186,15 +192,8 @@ TEST(StartStop, RequiredServiceOffIsNamed) {
 }
 
 TEST(StartStop, PackageBelowTheLimitIsDisabledWithItsDependentsAtBoot) {
-    testutil::TestPackage base = startable("base");
-    testutil::TestPackage app = startable("app");
-    app.info["install_dep_packages"] = "base";
-    install(base);
-    install(app);
+    ASSERT_NO_FATAL_FAILURE(startChain());
     PackageManager pm;
-    ASSERT_EQ(pm.serviceControl(kUserStart, "base", true, nullptr, nullptr, nullptr, true, true),
-              1);
-    ASSERT_EQ(pm.serviceControl(kUserStart, "app", true, nullptr, nullptr, nullptr, true, true), 1);
     testutil::writeFile(PKG_LIMIT_CONF, "base=\"2.0\"\n");
     unlink("/var/log/corvnosnotify.log");
 

@@ -2,6 +2,7 @@
 #include <stdio.h>
 #include <string.h>
 
+#include <algorithm>
 #include <string>
 #include <vector>
 
@@ -213,8 +214,12 @@ void printHelp() {
         "       corvpkg --version | --help\n"
         "       corvpkg <command> --help\n\n"
         "The package engine of the NOS appliance.\n\ncommands:\n");
+    int width = 0;
     for (const cli::Command& command : cli::commands()) {
-        printf("  %-12s %s\n", command.name, command.summary);
+        width = std::max(width, static_cast<int>(strlen(command.name)));
+    }
+    for (const cli::Command& command : cli::commands()) {
+        printf("  %-*s  %s\n", width, command.name, command.summary);
     }
 }
 

@@ -17,6 +17,7 @@
 #include "corv/process_runner.h"
 #include "corv/vlibc.h"
 #include "init_job.h"
+#include "io_util.h"
 
 extern char** environ;
 
@@ -34,27 +35,7 @@ constexpr char kShell[] = "/bin/sh";
 constexpr char kEnvProgram[] = "/usr/bin/env";
 constexpr long kPollNanoseconds = 20 * 1000 * 1000;
 
-class Fd {
-  public:
-    explicit Fd(int fd = -1) : fd_(fd) {}
-    ~Fd() {
-        if (fd_ >= 0) {
-            close(fd_);
-        }
-    }
-    Fd(const Fd&) = delete;
-    Fd& operator=(const Fd&) = delete;
-    int get() const { return fd_; }
-    void reset() {
-        if (fd_ >= 0) {
-            close(fd_);
-        }
-        fd_ = -1;
-    }
-
-  private:
-    int fd_;
-};
+using corvplat::UniqueFd;
 
 std::vector<char*> pointers(std::vector<std::string>& strings) {
     std::vector<char*> out;
@@ -108,15 +89,15 @@ std::vector<std::string> shellWords(const Job& job, const Process& process, cons
 int spawnDaemon(std::vector<std::string> argv, std::vector<std::string> env, int outFd) {
     std::vector<char*> args = pointers(argv);
     std::vector<char*> envp = pointers(env);
-    Fd devNull(open("/dev/null", O_RDWR | O_CLOEXEC));
+    UniqueFd devNull(open("/dev/null", O_RDWR | O_CLOEXEC));
     int fds[2];
     if (devNull.get() < 0 || pipe2(fds, O_CLOEXEC) != 0) {
         CORV_LOG_ERR("Failed to prepare to start %s, %m", argv[0].c_str());
         VLIBCErrSet(ERR_OPEN_FAILED);
         return -1;
     }
-    Fd readEnd(fds[0]);
-    Fd writeEnd(fds[1]);
+    UniqueFd readEnd(fds[0]);
+    UniqueFd writeEnd(fds[1]);
     const int out = outFd >= 0 ? outFd : devNull.get();
     pid_t child = VLIBCProcFork();
     if (child < 0) {
@@ -205,7 +186,7 @@ int RunJobProcess(const Job& job, const Process& process, const char* what,
     CORVUtils::ProcessRunner runner(kEnvProgram, std::move(args));
     runner.setWorkingDirectory("/");
     runner.setTimeout(kScriptTimeout);
-    Fd log(OpenJobLog(job));
+    UniqueFd log(OpenJobLog(job));
     int rc = runner.run(1, true, false, log.get());
     if (rc < 0) {
         CORV_LOG_ERR("%s of %s did not finish [0x%04X %s:%d]", what, job.name.c_str(),
@@ -215,7 +196,7 @@ int RunJobProcess(const Job& job, const Process& process, const char* what,
 }
 
 int SpawnMainProcess(const Job& job) {
-    Fd log(OpenJobLog(job));
+    UniqueFd log(OpenJobLog(job));
     int pid = spawnDaemon(shellWords(job, job.main, "main"), JobEnvironment(job, {}), log.get());
     if (pid < 0) {
         CORV_LOG_ERR("Failed to start the main process of %s", job.name.c_str());

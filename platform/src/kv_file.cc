@@ -23,45 +23,6 @@ constexpr const char kBlanks[] = " \t\r\v\f";
 constexpr const char kDefaultFormat[] = "%s=\"%s\"\n";
 constexpr mode_t kNewFileMode = 0644;
 
-class UniqueFd {
-  public:
-    explicit UniqueFd(int fd = -1) : fd_(fd) {}
-    ~UniqueFd() { reset(); }
-    UniqueFd(const UniqueFd&) = delete;
-    UniqueFd& operator=(const UniqueFd&) = delete;
-    int get() const { return fd_; }
-    // Closes now and reports close(2)'s verdict, which can be the first word of ENOSPC.
-    int reset() {
-        int rc = fd_ >= 0 ? close(fd_) : 0;
-        fd_ = -1;
-        return rc;
-    }
-
-  private:
-    int fd_;
-};
-
-// A temporary file that disappears unless it was renamed into place.
-class TempPath {
-  public:
-    explicit TempPath(std::string path) : path_(std::move(path)) {}
-    ~TempPath() {
-        if (!path_.empty()) {
-            unlink(path_.c_str());
-        }
-    }
-    TempPath(const TempPath&) = delete;
-    TempPath& operator=(const TempPath&) = delete;
-    void release() { path_.clear(); }
-
-  private:
-    std::string path_;
-};
-
-int spaceOr(int err, int otherwise) {
-    return (err == ENOSPC || err == EDQUOT) ? ERR_NO_SPACE : otherwise;
-}
-
 std::string_view trim(std::string_view s) {
     size_t b = s.find_first_not_of(kBlanks);
     if (b == std::string_view::npos) {
@@ -129,70 +90,11 @@ std::string_view separatorOf(const char* separator) {
 // The whole file in one buffer. With `missing`, an absent file is an empty text and
 // *missing says so; without, it is a failure.
 bool readWhole(const char* path, std::string& text, bool* missing = nullptr) {
-    if (missing) {
-        *missing = false;
-    }
-    UniqueFd fd(open(path, O_RDONLY | O_CLOEXEC));
-    if (fd.get() < 0) {
-        if (errno == ENOENT && missing) {
-            *missing = true;
-            text.clear();
-            return true;
-        }
-        CORV_LOG_ERR("Failed to open %s, %m", path);
-        VLIBCErrSet(ERR_OPEN_FAILED);
-        return false;
-    }
-    struct stat st {};
-    if (fstat(fd.get(), &st) != 0) {
-        CORV_LOG_ERR("Failed to stat %s, %m", path);
-        VLIBCErrSet(ERR_STAT_FAILED);
-        return false;
-    }
-    if (S_ISDIR(st.st_mode)) {
-        CORV_LOG_ERR("%s is a directory", path);
-        VLIBCErrSet(ERR_IS_DIRECTORY);
-        return false;
-    }
-    const size_t limit = VLIBC_KV_MAX_FILE;
-    if (st.st_size > static_cast<off_t>(limit)) {
-        CORV_LOG_ERR("%s is too large (%lld bytes)", path, static_cast<long long>(st.st_size));
-        VLIBCErrSet(ERR_READ_FAILED);
-        return false;
-    }
-    // One byte beyond the stated size, so that the end shows in the first read; files
-    // of /proc and the like state no size at all and grow the buffer.
-    text.resize(st.st_size > 0 ? static_cast<size_t>(st.st_size) + 1 : 4096);
-    size_t used = 0;
-    for (;;) {
-        if (used == text.size()) {
-            if (used > limit) {
-                CORV_LOG_ERR("%s grew too large while being read", path);
-                VLIBCErrSet(ERR_READ_FAILED);
-                return false;
-            }
-            text.resize(used * 2 > limit + 1 ? limit + 1 : used * 2);
-        }
-        ssize_t n = VLIBCRead(fd.get(), &text[used], text.size() - used);
-        if (n < 0) {
-            CORV_LOG_ERR("Failed to read %s, %m", path);
-            VLIBCErrSet(ERR_READ_FAILED);
-            return false;
-        }
-        if (n == 0) {
-            break;
-        }
-        used += static_cast<size_t>(n);
-    }
-    if (used > limit) {
-        CORV_LOG_ERR("%s is too large", path);
-        VLIBCErrSet(ERR_READ_FAILED);
-        return false;
-    }
-    text.resize(used);
-    return true;
+    return corvplat::readWhole(path, VLIBC_KV_MAX_FILE, text, missing);
 }
 
+using corvplat::spaceOr;
+using corvplat::UniqueFd;
 using corvplat::writeAll;
 
 // Replaces `path` by `content`: written beside it and renamed over it, so that a reader
@@ -208,48 +110,8 @@ bool replaceFile(const char* path, const std::string& content) {
         }
     }
     const bool existed = stat(target.c_str(), &st) == 0;
-    size_t slash = target.rfind('/');
-    std::string tmp = slash == std::string::npos
-                          ? "." + target
-                          : target.substr(0, slash + 1) + "." + target.substr(slash + 1);
-    tmp += ".XXXXXX";
-    UniqueFd fd(mkostemp(&tmp[0], O_CLOEXEC));
-    if (fd.get() < 0) {
-        int err = errno;
-        CORV_LOG_ERR("Failed to create a temporary file for %s, %m", target.c_str());
-        VLIBCErrSet(spaceOr(err, ERR_CREATE_FAILED));
-        return false;
-    }
-    TempPath cleanup(tmp);
-    if (!writeAll(fd.get(), content.data(), content.size()) || fsync(fd.get()) != 0) {
-        int err = errno;
-        CORV_LOG_ERR("Failed to write %s, %m", tmp.c_str());
-        VLIBCErrSet(spaceOr(err, ERR_WRITE_FAILED));
-        return false;
-    }
-    if (fchmod(fd.get(), existed ? (st.st_mode & 07777) : kNewFileMode) != 0) {
-        CORV_LOG_ERR("Failed to chmod %s, %m", tmp.c_str());
-        VLIBCErrSet(ERR_CHOWN_FAILED);
-        return false;
-    }
-    // Only root can give the file back to its owner; anyone else owns what it writes.
-    if (existed && (st.st_uid != geteuid() || st.st_gid != getegid()) &&
-        fchown(fd.get(), st.st_uid, st.st_gid) != 0 && geteuid() == 0) {
-        CORV_LOG_ERR("Failed to chown %s, %m", tmp.c_str());
-    }
-    if (fd.reset() != 0) {
-        int err = errno;
-        CORV_LOG_ERR("Failed to close %s, %m", tmp.c_str());
-        VLIBCErrSet(spaceOr(err, ERR_WRITE_FAILED));
-        return false;
-    }
-    if (rename(tmp.c_str(), target.c_str()) != 0) {
-        CORV_LOG_ERR("Failed to rename %s to %s, %m", tmp.c_str(), target.c_str());
-        VLIBCErrSet(ERR_RENAME_FAILED);
-        return false;
-    }
-    cleanup.release();
-    return true;
+    return corvplat::replaceWhole(target, content, existed ? (st.st_mode & 07777) : kNewFileMode,
+                                  existed ? &st : nullptr);
 }
 
 // Keys and values that would not read back as written are refused: a newline would

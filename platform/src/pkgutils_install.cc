@@ -12,32 +12,14 @@
 #include "corv/log.h"
 #include "corv/pkgutils.h"
 #include "corv/vlibc.h"
+#include "io_util.h"
 
 namespace CORV {
 namespace PkgUtils {
 
 namespace {
 
-class Fd {
-  public:
-    explicit Fd(int fd) : fd_(fd) {}
-    ~Fd() {
-        if (fd_ >= 0) {
-            close(fd_);
-        }
-    }
-    Fd(const Fd&) = delete;
-    Fd& operator=(const Fd&) = delete;
-    int get() const { return fd_; }
-    int release() {
-        int fd = fd_;
-        fd_ = -1;
-        return fd;
-    }
-
-  private:
-    int fd_;
-};
+using corvplat::UniqueFd;
 
 bool CopyAll(int from, int to) {
     char buffer[65536];
@@ -75,14 +57,14 @@ bool InstallConfigFile(const std::string& source, const std::string& destination
         VLIBCErrSet(0x0800);
         return false;
     }
-    Fd in(open(source.c_str(), O_RDONLY | O_CLOEXEC));
+    UniqueFd in(open(source.c_str(), O_RDONLY | O_CLOEXEC));
     if (in.get() < 0) {
         CORV_LOG_ERR("Failed to open %s (%m)", source.c_str());
         VLIBCErrSet(ERR_OPEN_FAILED);
         return false;
     }
     std::string tmp = destination + ".XXXXXX";
-    Fd out(mkstemp(&tmp[0]));
+    UniqueFd out(mkstemp(&tmp[0]));
     if (out.get() < 0) {
         CORV_LOG_ERR("Failed to create tmp file for %s (%m)", destination.c_str());
         VLIBCErrSet(ERR_CREATE_FAILED);

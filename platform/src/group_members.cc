@@ -9,82 +9,26 @@
 #include <string>
 #include <vector>
 
+#include "account_db.h"
 #include "corv/app_priv.h"
 #include "corv/log.h"
 #include "corv/vlibc.h"
 
 namespace {
 
-constexpr size_t kFirstBuffer = 16384;
-constexpr size_t kMaxBuffer = 16 * 1024 * 1024;
-
-// A group as getgrnam_r gives it, with the storage its strings point into.
-struct GroupEntry {
-    struct group gr {};
-    std::vector<char> storage;
-};
-
-// 1 found, 0 no such group, -1 lookup failure (error slot set).
-int lookUpGroup(const char* name, GroupEntry& entry) {
-    for (size_t size = kFirstBuffer; size <= kMaxBuffer; size *= 2) {
-        entry.storage.resize(size);
-        struct group* found = nullptr;
-        int rc = getgrnam_r(name, &entry.gr, entry.storage.data(), size, &found);
-        if (rc == ERANGE) {
-            continue;
-        }
-        if (rc != 0) {
-            errno = rc;
-            CORV_LOG_ERR("getgrnam_r(%s) failed, %m", name);
-            VLIBCErrSet(ERR_READ_FAILED);
-            return -1;
-        }
-        return found != nullptr ? 1 : 0;
-    }
-    CORV_LOG_ERR("Group %s is too large to read", name);
-    VLIBCErrSet(ERR_OUT_OF_MEMORY);
-    return -1;
-}
-
-// 1 found (primary gid filled), 0 no such user, -1 failure.
-int lookUpUser(const char* name, gid_t* gid) {
-    for (size_t size = kFirstBuffer; size <= kMaxBuffer; size *= 2) {
-        std::vector<char> storage(size);
-        struct passwd pw {};
-        struct passwd* found = nullptr;
-        int rc = getpwnam_r(name, &pw, storage.data(), size, &found);
-        if (rc == ERANGE) {
-            continue;
-        }
-        if (rc != 0) {
-            errno = rc;
-            CORV_LOG_ERR("getpwnam_r(%s) failed, %m", name);
-            VLIBCErrSet(ERR_READ_FAILED);
-            return -1;
-        }
-        if (found == nullptr) {
-            return 0;
-        }
-        *gid = pw.pw_gid;
-        return 1;
-    }
-    VLIBCErrSet(ERR_OUT_OF_MEMORY);
-    return -1;
-}
-
 // The names of the users whose primary group is `gid`. The enumeration of the password
 // database has one cursor per process, hence the mutex.
 bool usersWithPrimaryGroup(gid_t gid, std::vector<std::string>& names) {
     static std::mutex cursor;
     std::lock_guard<std::mutex> guard(cursor);
-    std::vector<char> storage(kFirstBuffer);
+    std::vector<char> storage(corvplat::kFirstAccountBuffer);
     setpwent();
     bool ok = true;
     for (;;) {
         struct passwd pw {};
         struct passwd* found = nullptr;
         int rc = getpwent_r(&pw, storage.data(), storage.size(), &found);
-        if (rc == ERANGE && storage.size() < kMaxBuffer) {
+        if (rc == ERANGE && storage.size() < corvplat::kMaxAccountBuffer) {
             storage.resize(storage.size() * 2);  // the same entry is read again
             continue;
         }
@@ -114,15 +58,15 @@ int VLIBGroupIsAdminGroupMem(const char* user, int) {
         return -1;
     }
     gid_t primary = 0;
-    int rc = lookUpUser(user, &primary);
+    int rc = corvplat::lookUpUser(user, nullptr, &primary);
     if (rc <= 0) {
         if (rc == 0) {
             VLIBCErrSet(ERR_NO_SUCH_USER);
         }
         return -1;
     }
-    GroupEntry admins;
-    rc = lookUpGroup(CORV_ADMIN_GROUP, admins);
+    corvplat::GroupEntry admins;
+    rc = corvplat::lookUpGroup(CORV_ADMIN_GROUP, admins);
     if (rc <= 0) {
         if (rc == 0) {
             VLIBCErrSet(ERR_NO_SUCH_GROUP);
@@ -145,8 +89,8 @@ int CORVGroupListMember(const char* group, PVLIBSZLIST* list) {
         VLIBCErrSet(ERR_BAD_PARAMETERS);
         return -1;
     }
-    GroupEntry entry;
-    int rc = lookUpGroup(group, entry);
+    corvplat::GroupEntry entry;
+    int rc = corvplat::lookUpGroup(group, entry);
     if (rc <= 0) {
         if (rc == 0) {
             VLIBCErrSet(ERR_NO_SUCH_GROUP);

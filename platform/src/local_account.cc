@@ -7,6 +7,7 @@
 #include <string>
 #include <vector>
 
+#include "account_db.h"
 #include "corv/log.h"
 #include "corv/user.h"
 #include "corv/vlibc.h"
@@ -42,23 +43,6 @@ bool named(const char* name, const char* const (&list)[N]) {
     return false;
 }
 
-// getgrnam_r with a buffer that grows until the record fits. 1 found, 0 none, -1 failure.
-int readGroup(const char* name, struct group& gr, std::vector<char>& storage) {
-    for (size_t size = 16384; size <= 16 * 1024 * 1024; size *= 2) {
-        storage.resize(size);
-        struct group* found = nullptr;
-        int rc = getgrnam_r(name, &gr, storage.data(), storage.size(), &found);
-        if (rc == ERANGE) {
-            continue;
-        }
-        if (rc != 0) {
-            return -1;
-        }
-        return found != nullptr ? 1 : 0;
-    }
-    return -1;
-}
-
 }  // namespace
 
 bool CORVUserIsReserved(const char* user, uid_t uid) {
@@ -79,11 +63,9 @@ int CORVGroupGet(const char* name, PCORVGROUP* out) {
         VLIBCErrSet(ERR_BAD_PARAMETERS);
         return -1;
     }
-    struct group gr {};
-    std::vector<char> storage;
-    int found = readGroup(name, gr, storage);
+    corvplat::GroupEntry entry;
+    int found = corvplat::lookUpGroup(name, entry);
     if (found < 0) {
-        VLIBCErrSet(ERR_READ_FAILED);
         return -1;
     }
     if (found == 0) {
@@ -91,7 +73,7 @@ int CORVGroupGet(const char* name, PCORVGROUP* out) {
         return -1;
     }
     unsigned count = 0;
-    while (gr.gr_mem != nullptr && gr.gr_mem[count] != nullptr) {
+    while (entry.gr.gr_mem != nullptr && entry.gr.gr_mem[count] != nullptr) {
         ++count;
     }
     PCORVGROUP group = static_cast<PCORVGROUP>(calloc(1, sizeof(CORVGROUP)));
@@ -99,12 +81,12 @@ int CORVGroupGet(const char* name, PCORVGROUP* out) {
         VLIBCErrSet(ERR_OUT_OF_MEMORY);
         return -1;
     }
-    group->gid = gr.gr_gid;
-    group->name = strdup(gr.gr_name);
+    group->gid = entry.gr.gr_gid;
+    group->name = strdup(entry.gr.gr_name);
     group->ppszMember = static_cast<char**>(calloc(count + 1, sizeof(char*)));
     bool ok = group->name != nullptr && group->ppszMember != nullptr;
     for (unsigned i = 0; ok && i < count; ++i) {
-        group->ppszMember[i] = strdup(gr.gr_mem[i]);
+        group->ppszMember[i] = strdup(entry.gr.gr_mem[i]);
         ok = group->ppszMember[i] != nullptr;
         group->nMember = i + 1;
     }

@@ -1,11 +1,7 @@
 // Users and groups are the system's own accounts.
 #include "corv/user.h"
 
-#include <grp.h>
-#include <pwd.h>
-
-#include <vector>
-
+#include "account_db.h"
 #include "corv/vlibc.h"
 
 int CORVUserGetUGID(const char* user, uid_t* uid, gid_t* gid) {
@@ -13,17 +9,13 @@ int CORVUserGetUGID(const char* user, uid_t* uid, gid_t* gid) {
         VLIBCErrSet(ERR_BAD_PARAMETERS);
         return -1;
     }
-    std::vector<char> buf(16384);
-    struct passwd pw {};
-    struct passwd* found = nullptr;
-    if (getpwnam_r(user, &pw, buf.data(), buf.size(), &found) != 0 || found == nullptr) {
-        VLIBCErrSet(ERR_NO_SUCH_USER);
+    int found = corvplat::lookUpUser(user, uid, gid);
+    if (found <= 0) {
+        if (found == 0) {
+            VLIBCErrSet(ERR_NO_SUCH_USER);
+        }
         return -1;
     }
-    if (uid)
-        *uid = pw.pw_uid;
-    if (gid)
-        *gid = pw.pw_gid;
     return 0;
 }
 
@@ -32,14 +24,15 @@ int CORVGroupGetGID(const char* group, gid_t* gid) {
         VLIBCErrSet(ERR_BAD_PARAMETERS);
         return -1;
     }
-    std::vector<char> buf(65536);
-    struct group gr {};
-    struct group* found = nullptr;
-    if (getgrnam_r(group, &gr, buf.data(), buf.size(), &found) != 0 || found == nullptr) {
-        VLIBCErrSet(ERR_NO_SUCH_GROUP);
+    corvplat::GroupEntry entry;
+    int found = corvplat::lookUpGroup(group, entry);
+    if (found <= 0) {
+        if (found == 0) {
+            VLIBCErrSet(ERR_NO_SUCH_GROUP);
+        }
         return -1;
     }
     if (gid)
-        *gid = gr.gr_gid;
+        *gid = entry.gr.gr_gid;
     return 0;
 }

@@ -406,12 +406,8 @@ final:
     if (getResult() != PKG_ERR_LOCKED && VLIBCFileCheckDir(workDir.c_str())) {
         PMSRunLogged(info, type, cmd.removeWorkDir);
     }
-    {
-        char line[4096];
-        snprintf(line, sizeof(line), "%s %s %s %s", "install", info.package.c_str(),
-                 info.version.c_str(), outcome ? "successfully" : "failed");
-        PMSWriteSysLog(line);
-    }
+    PMSWriteSysLogf("%s %s %s %s", "install", info.package.c_str(), info.version.c_str(),
+                    outcome ? "successfully" : "failed");
     PMSCheckServiesStatus(info, nullptr, type, -1);
     return outcome;
 }

@@ -15,6 +15,8 @@ const char* PMSStatusWord(int type);
 namespace CORVPackageTool {
 
 // /var/packages/<name>, and the package's settings directory /usr/corv/etc/packages/<name>.
+// PMSWriteSysLog of a printf-style line, cut at 4095 bytes.
+void PMSWriteSysLogf(const char* format, ...) __attribute__((format(printf, 1, 2)));
 std::string PMSRegistryDir(const std::string& name);
 std::string PMSPackageEtcDir(const std::string& name);
 // The registry's `target` link leads to a directory on a volume that has not failed.

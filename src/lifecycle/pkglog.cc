@@ -2,6 +2,7 @@
 // programs run after every operation.
 #include <dirent.h>
 #include <fcntl.h>
+#include <stdarg.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
@@ -54,6 +55,15 @@ void PMSWriteSysLog(const char* message) {
     }
     fprintf(log, "%s\t%s\n", stamp, message);
     fclose(log);
+}
+
+void PMSWriteSysLogf(const char* format, ...) {
+    char line[4096];
+    va_list args;
+    va_start(args, format);
+    vsnprintf(line, sizeof(line), format, args);
+    va_end(args);
+    PMSWriteSysLog(line);
 }
 
 int PMSRunAndWriteScriptLog(const PackageInfo& info, PKG_INSTALLATION_TYPE type,

@@ -1,6 +1,5 @@
 // Start and stop of a package together with the packages that depend on it, under the
 // package lock and a task record that others can follow.
-#include <stdio.h>
 #include <algorithm>
 #include <string>
 #include <vector>
@@ -47,10 +46,8 @@ int PackageManager::serviceControl(PKG_INSTALLATION_TYPE type, const std::string
         for (const std::string& entry : list) {
             names += (names.empty() ? "" : ",") + entry;
         }
-        char line[4096];
-        snprintf(line, sizeof(line), "%s %s: begin to %s packages %s", parseInstallTypeToStr(type),
-                 name.c_str(), start ? "start" : "stop", names.c_str());
-        PMSWriteSysLog(line);
+        PMSWriteSysLogf("%s %s: begin to %s packages %s", parseInstallTypeToStr(type), name.c_str(),
+                        start ? "start" : "stop", names.c_str());
     }
     // 6. Dependents run on a manager of their own, so that what the caller reads
     // afterwards (result, parameters, package) is the named package's.

@@ -2,7 +2,6 @@
 // the prestart/prestop questions to the package, the resources tied to the running state,
 // and the job itself.
 #include <fcntl.h>
-#include <stdarg.h>
 #include <stdio.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -34,17 +33,6 @@ namespace {
 
 constexpr const char* kNotifier = "/usr/corv/bin/corvnosnotify";
 constexpr const char* kDesktopLinkDir = "/usr/corv/corvman/webui/3rdparty/";
-constexpr int kLineSize = 4096;
-
-void writeSysLog(const char* format, ...) __attribute__((format(printf, 1, 2)));
-void writeSysLog(const char* format, ...) {
-    char line[kLineSize];
-    va_list args;
-    va_start(args, format);
-    vsnprintf(line, sizeof(line), format, args);
-    va_end(args);
-    PMSWriteSysLog(line);
-}
 
 bool exists(const std::string& path) {
     return access(path.c_str(), F_OK) == 0;
@@ -165,8 +153,8 @@ int PackageManager::serviceControlAction(PKG_INSTALLATION_TYPE type, const std::
     // 1.
     setResult(start ? PKG_ERR_START_FAILED : PKG_ERR_STOP_FAILED);
     const std::string script = getServiceScript(name, info);
-    writeSysLog("%s %s: begin to %s version %s", parseInstallTypeToStr(type), name.c_str(), verb,
-                info.version.c_str());
+    PMSWriteSysLogf("%s %s: begin to %s version %s", parseInstallTypeToStr(type), name.c_str(),
+                    verb, info.version.c_str());
 
     if (start) {
         // 2. A package never runs without what it declared it needs.
@@ -358,9 +346,9 @@ final:
         }
     }
     // 21.
-    writeSysLog("%s %s: %s version %s %s, result %d", parseInstallTypeToStr(type), name.c_str(),
-                verb, info.version.c_str(), outcome ? "successfully" : "failed",
-                static_cast<int>(getResult()));
+    PMSWriteSysLogf("%s %s: %s version %s %s, result %d", parseInstallTypeToStr(type), name.c_str(),
+                    verb, info.version.c_str(), outcome ? "successfully" : "failed",
+                    static_cast<int>(getResult()));
     PMSCheckServiesStatus(info, nullptr, type, start ? 1 : 0);
     CleanAllEnv();
     return outcome;

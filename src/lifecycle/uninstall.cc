@@ -201,12 +201,8 @@ final:
         }
     }
     // 16.
-    {
-        char line[4096];
-        snprintf(line, sizeof(line), "%s %s: Uninstall %s %s", parseInstallTypeToStr(type),
-                 name.c_str(), info.version.c_str(), outcome ? "successfully" : "failed");
-        PMSWriteSysLog(line);
-    }
+    PMSWriteSysLogf("%s %s: Uninstall %s %s", parseInstallTypeToStr(type), name.c_str(),
+                    info.version.c_str(), outcome ? "successfully" : "failed");
     // 17. An upgrade goes on under the same lock and runs the hooks itself.
     if (type == 4) {
         PMSCheckServiesStatus(info, nullptr, type, -1);

@@ -346,13 +346,9 @@ final:
     if (!upgradeTmp.empty()) {
         VLIBCExec("/bin/rm", "-rf", upgradeTmp.c_str(), nullptr);
     }
-    {
-        char line[4096];
-        snprintf(line, sizeof(line), "%s %s from %s to %s %s", "upgrade", oldInfo.package.c_str(),
-                 oldInfo.version.c_str(), newInfo.version.c_str(),
-                 outcome ? "successfully" : "failed");
-        PMSWriteSysLog(line);
-    }
+    PMSWriteSysLogf("%s %s from %s to %s %s", "upgrade", oldInfo.package.c_str(),
+                    oldInfo.version.c_str(), newInfo.version.c_str(),
+                    outcome ? "successfully" : "failed");
     if (getResult() != PKG_ERR_LOCKED && VLIBCFileCheckDir(workDir.c_str())) {
         PMSRunLogged(newInfo, type, cmd.removeWorkDir);
     }

@@ -1,8 +1,7 @@
 // The example packages of examples/: each builds with the command line and reads back as
 // its source says; greeter is installable only beside a running hello of a fitting
-// version; and their scripts do what the demo relies on, run with the environment and
-// the identity that the engine gives them, in the engine's order of an install and an
-// upgrade.
+// version; and, installed and upgraded by the engine, their scripts and daemons do what
+// the demo relies on.
 #include <arpa/inet.h>
 #include <netinet/in.h>
 #include <sys/socket.h>
@@ -23,9 +22,11 @@
 #include "corv/service.h"
 #include "corv/vlibc.h"
 #include "corvpkg/json_util.h"
+#include "corvpkg/packagemanager.h"
 #include "corvpkg/pkglog.h"
 #include "corvpkg/pkgtool.h"
 #include "corvpkg/pkgvolume.h"
+#include "corvpkg/pkgwizard.h"
 #include "corvpkg/privilege.h"
 #include "corvpkg/resource.h"
 #include "support/files.h"
@@ -66,112 +67,37 @@ Json::Value cliJson(const std::vector<std::string>& args, int expectedStatus) {
     return out;
 }
 
-// Unpacks a package file as the install does: the archive in `workDir`, the payload in
-// `workDir`/package.
-void unpack(const std::string& cpk, const std::string& workDir) {
-    testutil::removeAll(workDir);
-    ASSERT_EQ(VLIBCExec("/bin/mkdir", "-p", (workDir + "/package").c_str(), nullptr), 0);
-    ASSERT_EQ(VLIBCExec("/bin/tar", "xf", cpk.c_str(), "-C", workDir.c_str(), nullptr), 0);
-    ASSERT_EQ(VLIBCExec("/bin/tar", "xzf", (workDir + "/package.tgz").c_str(), "-C",
-                        (workDir + "/package").c_str(), nullptr),
-              0);
-}
-
-// Moves an unpacked package into place as registration does: the payload to
-// /volume1/@appstore/<name> (into a fresh directory made by root when `intoFreshTarget`,
-// as an upgrade moves it), the control files to /var/packages/<name>, the target link, and
-// the package's etc dir for its user.
-void place(const std::string& workDir, const std::string& name, const std::string& user,
-           bool intoFreshTarget) {
-    const std::string target = "/volume1/@appstore/" + name;
-    const std::string registry = "/var/packages/" + name;
-    ASSERT_EQ(VLIBCExec("/bin/mkdir", "-p", "/volume1/@appstore", registry.c_str(), nullptr), 0);
-    if (intoFreshTarget) {
-        ASSERT_EQ(VLIBCExec("/bin/mkdir", "-p", target.c_str(), nullptr), 0);
-        ASSERT_EQ(VLIBCExec("/bin/sh", "-c",
-                            ("/bin/mv -f " + workDir + "/package/* " + target).c_str(), nullptr),
-                  0);
-    } else {
-        ASSERT_EQ(
-            VLIBCExec("/bin/mv", "-f", (workDir + "/package").c_str(), target.c_str(), nullptr), 0);
-    }
-    for (const char* part : {"INFO", "scripts", "conf", "WIZARD_UIFILES"}) {
-        if (testutil::exists(workDir + "/" + part)) {
-            ASSERT_EQ(VLIBCExec("/bin/mv", "-f", (workDir + "/" + part).c_str(), registry.c_str(),
-                                nullptr),
-                      0);
-        }
-    }
-    unlink((registry + "/target").c_str());
-    ASSERT_EQ(symlink(target.c_str(), (registry + "/target").c_str()), 0);
-    const std::string etc = "/usr/corv/etc/packages/" + name;
-    ASSERT_EQ(VLIBCExec("/bin/mkdir", "-p", etc.c_str(), nullptr), 0);
-    if (!user.empty()) {
-        ASSERT_EQ(VLIBCExec("/bin/chown", (user + ":" + user).c_str(), etc.c_str(), nullptr), 0);
-    }
-}
-
-// The package user with the payload in its hands, as the install's attribute revision
-// leaves it.
-void makeUserOwn(const std::string& user, const std::string& payload) {
-    if (run("/usr/bin/id", {user}).status != 0) {
-        ASSERT_EQ(VLIBCExec("/usr/sbin/useradd", "--system", "--no-create-home", "--user-group",
-                            "--shell", "/usr/sbin/nologin", user.c_str(), nullptr),
-                  0);
-    }
-    ASSERT_EQ(VLIBCExec("/bin/chown", "-hR", (user + ":" + user).c_str(), payload.c_str(), nullptr),
-              0);
-}
-
 PackageInfo infoOf(const std::string& dir) {
     PackageInfo info;
     EXPECT_TRUE(PMSLoadPKGInfoFile(dir, info, "enu", PKG_INFO_MASK_ALL)) << dir;
     return info;
 }
 
-struct Script {
-    std::string path;
-    std::string action;  // for the identity of conf/privilege
-    std::vector<std::string> args;
-};
-
-// Runs a package script as the engine does: the environment of PMSPrepareScriptEnv plus
-// `more`, the identity that the package's conf/privilege (in `privilegeDir`, or the
-// registry when empty) gives for the action.
-testutil::RunResult runScript(const Script& script, const PackageInfo& info,
-                              PKG_INSTALLATION_TYPE type, const Json::Value* answers,
-                              const std::vector<std::pair<std::string, std::string>>& more,
-                              const std::string& privilegeDir = "") {
-    const std::string logFile = "/tmp/corvpkgmgr.log-" + info.package;
-    CORVUtils::ProcessRunner runner(script.path, script.args);
-    runner.setTimeout(60);
-    PMSPrepareScriptEnv(info, runner, "enu", &logFile, type, answers,
-                        type == PKG_INSTALL || type == PKG_UPGRADE ? "/volume1" : nullptr, nullptr,
-                        nullptr);
-    for (const auto& [name, value] : more) {
-        runner.addEnv(name, value);
-    }
-    testutil::RunResult result;
-    if (!Privilege::SetIdentity(runner, info.package, script.action, privilegeDir)) {
-        ADD_FAILURE() << "no identity for " << script.path;
-        return result;
-    }
-    result.status = runner.run(true, true);
-    result.out = runner.getCapturedOutput();
-    result.err = runner.getCapturedOutputErr();
-    CleanAllEnv();
-    return result;
-}
-
-// The control script of an installed package with one action, as its job runs it.
+// The control script of an installed package with one action, as its job runs it: with
+// the environment and the identity that the engine gives it, behind the engine's back.
 int control(const std::string& name, const std::string& action) {
     const std::string registry = "/var/packages/" + name;
-    Script script{registry + "/scripts/start-stop-status", action, {action}};
-    auto r =
-        runScript(script, infoOf(registry), action == "start" ? PKG_START : PKG_STOP, nullptr, {});
-    EXPECT_TRUE(r.status != 0 || r.err.empty())
-        << "a good run is a quiet one: " << name << " " << action << ": " << r.err;
-    return r.status;
+    const std::string logFile = "/tmp/corvpkgmgr.log-" + name;
+    CORVUtils::ProcessRunner runner(registry + "/scripts/start-stop-status", {action});
+    runner.setTimeout(60);
+    PMSPrepareScriptEnv(infoOf(registry), runner, "enu", &logFile,
+                        action == "start" ? PKG_START : PKG_STOP, nullptr, nullptr, nullptr,
+                        nullptr);
+    EXPECT_TRUE(Privilege::SetIdentity(runner, name, action, "")) << name << " " << action;
+    int status = runner.run(true, true);
+    EXPECT_TRUE(status != 0 || runner.getCapturedOutputErr().empty())
+        << "a good run is a quiet one: " << name << " " << action << ": "
+        << runner.getCapturedOutputErr();
+    CleanAllEnv();
+    return status;
+}
+
+// Installs a package file through the engine; 1 on success.
+int engineInstall(const std::string& cpk, bool start, const Json::Value* answers = nullptr) {
+    PackageManager pm;
+    int outcome = pm.install(nullptr, cpk, "/volume1", start, answers, "enu", true, false);
+    EXPECT_TRUE(outcome == 1 || pm.getResult() != PKG_OK) << cpk;
+    return outcome;
 }
 
 struct Answer {
@@ -225,31 +151,23 @@ std::string firstLine(const std::string& path) {
 
 const char kHelloBody[] = "hello from a corvpkg package\n";
 
-// hello from its package file, installed and running as the demo leaves it: the real
-// status script answers, the `enabled` flag is set and its job runs.
+// hello from its package file, installed by the engine and started or not; `version`
+// other than the file's is written into the registry's INFO, as an older or newer hello
+// would have left it.
 void installHello(const std::string& version, bool running) {
-    ASSERT_NO_FATAL_FAILURE(unpack(cpkOf("hello", "1.0.0-0001"), "/tmp/work-hello"));
-    ASSERT_NO_FATAL_FAILURE(place("/tmp/work-hello", "hello", "", false));
+    ASSERT_EQ(engineInstall(cpkOf("hello", "1.0.0-0001"), running), 1);
     if (version != "1.0.0-0001") {
         std::string info = testutil::readFile("/var/packages/hello/INFO");
         info.replace(info.find("1.0.0-0001"), 10, version);
         testutil::writeFile("/var/packages/hello/INFO", info);
     }
-    if (running) {
-        ASSERT_EQ(control("hello", "start"), 0);
-        testutil::writeFile("/var/packages/hello/enabled", "");
-        ASSERT_TRUE(testutil::startPackageJob("hello"));
-    }
 }
 
 void removeHello() {
-    if (testutil::exists("/var/packages/hello/scripts/start-stop-status")) {
-        control("hello", "stop");
-    }
-    VLIBServiceStop("pkgctl-hello", 0);
-    for (const char* path : {"/var/packages/hello", "/volume1/@appstore/hello",
-                             "/etc/init/pkgctl-hello.conf", "/tmp/work-hello"}) {
-        testutil::removeAll(path);
+    if (PMSCheckPackage("hello")) {
+        PackageManager pm;
+        EXPECT_EQ(pm.uninstall("hello", nullptr, "enu", PKG_UNINSTALL, true, nullptr), 1)
+            << pm.getResult();
     }
 }
 
@@ -401,26 +319,18 @@ TEST(Examples, GreeterKeepsTheWizardAnswersThroughAnUpgrade) {
     acceptUnsignedPackages();
     ASSERT_NO_FATAL_FAILURE(buildAllWithTheScript());
     ASSERT_NO_FATAL_FAILURE(installHello("1.0.0-0001", true));
+    const std::string v1 = cpkOf("greeter", "1.0.0-0001");
 
     // The wizard asks for the two answers that the scripts read.
-    ASSERT_NO_FATAL_FAILURE(unpack(cpkOf("greeter", "1.0.0-0001"), "/tmp/work1"));
-    Json::Value wizard;
-    ASSERT_TRUE(fromString(testutil::readFile("/tmp/work1/WIZARD_UIFILES/install_uifile"), wizard));
+    PackageManager pm;
+    PackageInfo withWizard;
+    ASSERT_TRUE(pm.queryPackageFileInfoWithWizard(v1, withWizard, PKG_INSTALL, "enu"));
     Json::Value defaults(Json::objectValue);
-    for (const Json::Value& step : wizard) {
-        for (const Json::Value& item : step["items"]) {
-            defaults[item["key"].asString()] = item["defaultValue"];
-        }
-    }
+    getUIDefaultValues(withWizard.wizard, defaults);
     EXPECT_EQ(toString(defaults),
               R"({"GREETER_GREETING":"Good day from the greeter","GREETER_PORT":"8766"})");
 
-    // Fresh install: preinst from the work area, as the package user, refuses bad answers.
-    ASSERT_NO_FATAL_FAILURE(makeUserOwn("greeter", "/tmp/work1/package"));
-    PackageInfo v1 = infoOf("/tmp/work1");
-    const std::vector<std::pair<std::string, std::string>> work1 = {
-        {"CORVPKG_PKGINST_TEMP_DIR", "/tmp/work1/package"}};
-    const Script preinst1{"/tmp/work1/scripts/preinst", "preinst", {}};
+    // preinst refuses bad answers with a message, and nothing stays installed.
     const struct {
         const char* greeting;
         const char* port;
@@ -438,25 +348,19 @@ TEST(Examples, GreeterKeepsTheWizardAnswersThroughAnUpgrade) {
         Json::Value answers(Json::objectValue);
         answers["GREETER_GREETING"] = r.greeting;
         answers["GREETER_PORT"] = r.port;
-        EXPECT_EQ(runScript(preinst1, v1, PKG_INSTALL, &answers, work1, "/tmp/work1").status, 1);
+        EXPECT_EQ(engineInstall(v1, true, &answers), 0);
         EXPECT_EQ(testutil::readFile("/tmp/corvpkgmgr.log-greeter"), std::string(r.message) + "\n");
+        EXPECT_FALSE(PMSCheckPackage("greeter"));
     }
     Json::Value answers(Json::objectValue);
     answers["GREETER_GREETING"] = "Hi from the test";
     answers["GREETER_PORT"] = std::to_string(kGreeterPort);
-    auto ran = runScript(preinst1, v1, PKG_INSTALL, &answers, work1, "/tmp/work1");
-    ASSERT_EQ(ran.status, 0) << ran.out << ran.err;
-
-    ASSERT_NO_FATAL_FAILURE(place("/tmp/work1", "greeter", "greeter", false));
-    ran = runScript({"/var/packages/greeter/scripts/postinst", "postinst", {}}, v1, PKG_INSTALL,
-                    &answers, work1);
-    ASSERT_EQ(ran.status, 0) << ran.out << ran.err;
+    ASSERT_EQ(engineInstall(v1, true, &answers), 1);
     const std::string conf = "/volume1/@appstore/greeter/var/greeter.conf";
     EXPECT_NE(testutil::readFile(conf).find("\ngreeting=Hi from the test\nport=9123\n"),
               std::string::npos)
         << testutil::readFile(conf);
 
-    ASSERT_EQ(control("greeter", "start"), 0);
     Answer answer = httpGet(kGreeterPort);
     EXPECT_EQ(answer.body,
               "Hi from the test\n"
@@ -468,8 +372,6 @@ TEST(Examples, GreeterKeepsTheWizardAnswersThroughAnUpgrade) {
 
     // Enabled, the package has its crontab; its one job, run as the package user, leaves
     // the greeter's answer in var/heartbeat.
-    CORV::PkgUtils::WorkerResp resp;
-    ASSERT_TRUE(Resource::Acquire(Resource::TIMING_ENABLE, v1, PKG_START, resp, nullptr, ""));
     const std::string crontab = testutil::readFile("/var/spool/cron/crontabs/greeter");
     EXPECT_EQ(crontab, testutil::readFile("/volume1/@appstore/greeter/etc/greeter.crontab"));
     std::istringstream lines(crontab);
@@ -487,56 +389,24 @@ TEST(Examples, GreeterKeepsTheWizardAnswersThroughAnUpgrade) {
     EXPECT_EQ(heartbeat.run(true, true), 0) << job << ": " << heartbeat.getCapturedOutputErr();
     const std::string beat = testutil::readFile("/volume1/@appstore/greeter/var/heartbeat");
     EXPECT_NE(beat.find(" ok: Hi from the test\n"), std::string::npos) << beat;
-    ASSERT_TRUE(Resource::Release(Resource::TIMING_DISABLE, v1, PKG_STOP, resp, nullptr, ""));
+    ASSERT_EQ(pm.serviceControl("greeter", false, nullptr), 1);
     EXPECT_FALSE(testutil::exists("/var/spool/cron/crontabs/greeter"));
-    ASSERT_EQ(control("greeter", "stop"), 0);
 
     // The upgrade file passes the checks over the installed 1.0.0-0001: it has upgrade
     // scripts, and the port that it declares is the installed version's own.
     Json::Value check = cliJson({"check", cpkOf("greeter", "1.1.0-0001"), "--json"}, 0);
     EXPECT_TRUE(check["installable"].asBool()) << toString(check);
-
-    // Upgrade to 1.1.0-0001, step by step as the engine goes: preupgrade of the new package
-    // with the old one's data, the uninstall of the old one, the install of the new one.
-    ASSERT_NO_FATAL_FAILURE(unpack(cpkOf("greeter", "1.1.0-0001"), "/tmp/work2"));
-    ASSERT_NO_FATAL_FAILURE(makeUserOwn("greeter", "/tmp/work2/package"));
-    PackageInfo v2 = infoOf("/tmp/work2");
-    const std::string keep = Privilege::GetTmpFolderPath("greeter", "/volume1");
-    ASSERT_TRUE(Privilege::CreateTmpFolder("greeter", keep));
-    const std::vector<std::pair<std::string, std::string>> upgrade = {
-        {"CORVPKG_PKGINST_TEMP_DIR", "/tmp/work2/package"}, {"CORVPKG_OLD_PKGVER", "1.0.0-0001"}};
-    ran = runScript({"/tmp/work2/scripts/preupgrade", "preupgrade", {}}, v1, PKG_UPGRADE, nullptr,
-                    upgrade);
-    ASSERT_EQ(ran.status, 0) << ran.out << ran.err;
-    ran = runScript({"/var/packages/greeter/scripts/preuninst", "preuninst", {}}, v1, PKG_UPGRADE,
-                    nullptr, {});
-    ASSERT_EQ(ran.status, 0) << ran.out << ran.err;
-    testutil::removeAll("/volume1/@appstore/greeter");
-    ran = runScript({"/var/packages/greeter/scripts/postuninst", "postuninst", {}}, v1, PKG_UPGRADE,
-                    nullptr, {});
-    ASSERT_EQ(ran.status, 0) << ran.out << ran.err;
-    ASSERT_EQ(VLIBCExec("/usr/bin/find", "/var/packages/greeter", "-mindepth", "1", "-maxdepth",
-                        "1", "-exec", "rm", "-rf", "{}", ";", nullptr),
-              0);
-    ran = runScript({"/tmp/work2/scripts/preinst", "preinst", {}}, v2, PKG_UPGRADE, nullptr,
-                    upgrade, "/tmp/work2");
-    ASSERT_EQ(ran.status, 0) << ran.out << ran.err;
-    ASSERT_NO_FATAL_FAILURE(place("/tmp/work2", "greeter", "greeter", true));
-    for (const char* script : {"postinst", "postupgrade"}) {
-        ran = runScript({std::string("/var/packages/greeter/scripts/") + script, script, {}}, v2,
-                        PKG_UPGRADE, nullptr, upgrade);
-        ASSERT_EQ(ran.status, 0) << script << ": " << ran.out << ran.err;
-    }
-    testutil::removeAll(keep);
-
-    ASSERT_EQ(control("greeter", "start"), 0);
+    ASSERT_EQ(engineInstall(cpkOf("greeter", "1.1.0-0001"), true), 1);
+    EXPECT_FALSE(testutil::exists(Privilege::GetTmpFolderPath("greeter", "/volume1")));
+    EXPECT_FALSE(httpGet(kGreeterPort).connected) << "stopped before the upgrade, stopped after";
+    ASSERT_EQ(pm.serviceControl("greeter", true, nullptr), 1);
     EXPECT_EQ(httpGet(kGreeterPort).body,
               "Hi from the test\n"
               "greeter 1.1.0-0001; hello on port 8765 says: hello from a corvpkg package\n")
         << "the new version answers with the greeting chosen at install";
 
     // Without hello the greeter still answers, and says so.
-    removeHello();
+    ASSERT_EQ(control("hello", "stop"), 0);
     EXPECT_EQ(httpGet(kGreeterPort).body,
               "Hi from the test\n"
               "greeter 1.1.0-0001; hello on port 8765 does not answer (Connection refused)\n");

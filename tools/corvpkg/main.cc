@@ -211,7 +211,7 @@ namespace {
 void printHelp() {
     printf(
         "usage: corvpkg <command> [options]\n"
-        "       corvpkg --version | --help\n"
+        "       corvpkg --version | --help  (also -V, -h)\n"
         "       corvpkg <command> --help\n\n"
         "The package engine of the NOS appliance.\n\ncommands:\n");
     int width = 0;
@@ -235,7 +235,7 @@ int main(int argc, char** argv) {
         printHelp();
         return cli::EXIT_OK;
     }
-    if (args[0] == "--version") {
+    if (args[0] == "--version" || args[0] == "-V") {
         printf("corvpkg %s (libcorvpkg.so.1, NOS %d.%d-%d)\n",
                CORVPackageTool::CORVPKGLibraryVersion(), CORVPackageTool::PKG_OS_MAJOR,
                CORVPackageTool::PKG_OS_MINOR, CORVPackageTool::PKG_OS_BUILD);

@@ -135,6 +135,7 @@ bool PackageManager::verifyPackageTgzFile(const std::string& cpkFile, const char
     // 5.
     if (extract(cpkFile, work, "package.tgz", true) != 0) {
         CORV_LOG_ERR("Failed to extract the package.tgz in %s", work.c_str());
+        PMSExplainFailedUnpack(*this, work, PMSArchiveBytes(cpkFile, false, "package.tgz"));
         return false;
     }
     // 6.

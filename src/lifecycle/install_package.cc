@@ -96,6 +96,7 @@ bool PMSUnpackAndCheck(PackageManager& pm, PKG_INSTALLATION_TYPE type, InstallCo
     // 4.
     if (!PMSRunLogged(info, type, cmd.extractAll) || !PMSCheckPackageMembers(workDir)) {
         CORV_LOG_ERR("Failed to extract package, %s", cpkPath.c_str());
+        PMSExplainFailedUnpack(pm, workDir, PMSFileBytes(cpkPath));
         pm.setResult(PKG_ERR_BAD_ARCHIVE);
         return false;
     }
@@ -271,6 +272,7 @@ int PackageManager::install_package(const std::string& cpkPath, const std::strin
     if (!PMSRunLogged(info, type, cmd.extractPayload) ||
         !PMSDropSpecialFiles(workDir + "/package")) {
         CORV_LOG_ERR("Failed to unpack package.tgz, %s", cpkPath.c_str());
+        PMSExplainFailedUnpack(*this, workDir + "/package", PMSPayloadSize(info, workDir));
         setResult(PKG_ERR_BAD_ARCHIVE);
         goto final;
     }

@@ -133,6 +133,7 @@ int PackageManager::upgrade_package(const std::string& cpkPath, const std::strin
     if (!PMSRunLogged(newInfo, type, cmd.extractPayload) ||
         !PMSDropSpecialFiles(workDir + "/package")) {
         CORV_LOG_ERR("Failed to unpack package.tgz, %s", cpkPath.c_str());
+        PMSExplainFailedUnpack(*this, workDir + "/package", PMSPayloadSize(newInfo, workDir));
         setResult(PKG_ERR_BAD_ARCHIVE);
         goto final;
     }

@@ -262,6 +262,11 @@ TEST(Install, FullVolumeDuringUnpackLeavesNothing) {
     PackageManager pm;
     EXPECT_EQ(installAt(pm, file, "/volume2"), 0);
     EXPECT_EQ(pm.getResult(), PKG_ERR_BAD_ARCHIVE);
+    // The code stays that of a failed unpack; the words say what really went wrong.
+    const Json::Value space = pm.getJsonParam("no_space");
+    EXPECT_EQ(space["volume"].asString(), "/volume2") << toString(space);
+    EXPECT_GE(space["needed"].asUInt64(), 3u << 20) << toString(space);
+    EXPECT_LT(space["free"].asUInt64(), space["needed"].asUInt64()) << toString(space);
     EXPECT_FALSE(testutil::exists("/var/packages/demo"));
     EXPECT_FALSE(testutil::exists("/volume2/@tmp/pkginstall"));
     EXPECT_TRUE(testutil::scriptsRan("demo").empty());

@@ -25,6 +25,14 @@ CORVPKG_API unsigned int PMGetScriptMask(const std::string& scriptsDir);
 // an INFO that does not read still gives true, with `info` as the reader left it.
 bool PMSExtractPackageInfo(const std::string& dir, const std::string& cpkFile, PackageInfo& info,
                            const char* language);
+// Whether everything under `dir`, an unpacked package file or a member of one, is a
+// regular file or a directory: a link, pipe, device or socket among the control members
+// is refused (logged) before anything reads, writes or runs through it.
+bool PMSCheckPackageMembers(const std::string& dir);
+// Removes device nodes, pipes and sockets from an unpacked payload (each logged as
+// dropped) and clears the set-user-id and set-group-id bits of its files. False (logged)
+// when one cannot be removed or changed.
+bool PMSDropSpecialFiles(const std::string& payloadDir);
 // Whether the MD5 of the file, as /usr/bin/openssl prints it (lower-case hex), is
 // exactly `expected`.
 CORVPKG_API bool PMSCompareCheckSum(const char* path, const char* expected);

@@ -15,6 +15,8 @@
 
 namespace CORVPackageTool {
 
+class PackageManager;
+
 // Safety margins: on a data volume, and on the root file system.
 constexpr unsigned long long PKG_VOLUME_MARGIN = 0xA00000ULL;
 constexpr unsigned long long PKG_ROOT_MARGIN = 0xC800000ULL;
@@ -73,6 +75,26 @@ CORVPKG_API int VolumeCountGet(int kinds);
 // The volume exists, is ready and has at least `size` bytes free.
 CORVPKG_API bool PMSCheckVolStatus(const char* volume, unsigned long long size);
 bool PMSCheckFreeSpace(const char* path, unsigned long long size);
+
+// Full volumes in words. The bytes free for this process on the file system of `path`
+// (0 when it cannot be asked).
+unsigned long long PMSFreeBytes(const std::string& path);
+// The size of the file at `path`; 0 when there is none.
+unsigned long long PMSFileBytes(const std::string& path);
+// The sum of the sizes that `archive` lists, of all members or of `member` only.
+unsigned long long PMSArchiveBytes(const std::string& archive, bool compressed,
+                                   const std::string& member);
+// What the payload of the package unpacked in `workDir` takes unpacked: the sizes listed
+// in <workDir>/package.tgz, or the INFO's extractsize when that says more.
+unsigned long long PMSPayloadSize(const PackageInfo& info, const std::string& workDir);
+// Logs "Volume <v> is full: <needed> bytes needed, <free> bytes free" for the volume of
+// `path` and sets the JSON parameter "no_space" of `pm` to {"volume", "needed", "free"}.
+void PMSReportNoSpace(PackageManager& pm, const std::string& path, unsigned long long needed,
+                      unsigned long long free);
+// After an unpack into `dir` failed: when `needed` bytes did not fit in what was free
+// before it (free now plus what it wrote under `dir`), reports the full volume as above
+// and gives true.
+bool PMSExplainFailedUnpack(PackageManager& pm, const std::string& dir, unsigned long long needed);
 
 // Architecture and model of a package against this machine.
 CORVPKG_API bool PMSCheckPackageArchMatched(const PackageInfo& info);

@@ -54,7 +54,8 @@ bool readWhole(const char* path, size_t limit, std::string& text, bool* missing)
     if (missing) {
         *missing = false;
     }
-    UniqueFd fd(open(path, O_RDONLY | O_CLOEXEC));
+    // O_NONBLOCK: a named pipe in a file's place must not stall the open.
+    UniqueFd fd(open(path, O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
     if (fd.get() < 0) {
         if (errno == ENOENT && missing) {
             *missing = true;
@@ -74,6 +75,17 @@ bool readWhole(const char* path, size_t limit, std::string& text, bool* missing)
     if (S_ISDIR(st.st_mode)) {
         CORV_LOG_ERR("%s is a directory", path);
         VLIBCErrSet(ERR_IS_DIRECTORY);
+        return false;
+    }
+    // A pipe, device or socket would be read forever or never answer: it counts as no file.
+    if (!S_ISREG(st.st_mode)) {
+        if (missing) {
+            *missing = true;
+            text.clear();
+            return true;
+        }
+        CORV_LOG_ERR("%s is not a regular file", path);
+        VLIBCErrSet(ERR_OPEN_FAILED);
         return false;
     }
     if (st.st_size > static_cast<off_t>(limit)) {

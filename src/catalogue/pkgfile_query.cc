@@ -64,6 +64,9 @@ bool PMSExtractPackageInfo(const std::string& dir, const std::string& cpkFile, P
     }
     // 2. conf/ is optional.
     extract(cpkFile, dir, "conf", true);
+    if (!PMSCheckPackageMembers(dir)) {
+        return false;
+    }
     // 3, 4. A bad INFO is judged by the callers, from what was read.
     bool loaded = PMSLoadPKGInfoFile(dir, info, language, PKG_INFO_MASK_ALL);
     info.script_mask = 0;
@@ -76,7 +79,10 @@ bool PMSExtractPackageInfo(const std::string& dir, const std::string& cpkFile, P
         snprintf(member, sizeof(member), "scripts/%s", script.name);
         extract(cpkFile, dir, member, false);
     }
-    // 6.
+    // 6. A script that is a link would have its target made executable here.
+    if (!PMSCheckPackageMembers(dir)) {
+        return false;
+    }
     info.script_mask = PMGetScriptMask(dir + "/scripts");
     return true;
 }
@@ -129,6 +135,7 @@ bool PackageManager::verifyPackageTgzFile(const std::string& cpkFile, const char
     // 5.
     if (extract(cpkFile, work, "package.tgz", true) != 0) {
         CORV_LOG_ERR("Failed to extract the package.tgz in %s", work.c_str());
+        PMSExplainFailedUnpack(*this, work, PMSArchiveBytes(cpkFile, false, "package.tgz"));
         return false;
     }
     // 6.

@@ -12,6 +12,7 @@
 
 #include <string>
 
+#include "common/regular_file.h"
 #include "corv/log.h"
 #include "corv/vlibc.h"
 #include "corv/volume.h"
@@ -322,8 +323,8 @@ bool PMReadFile(const char* path, unsigned int limit, std::string& content,
     if (limit != 0 && limit < want) {
         want = limit;
     }
-    int fd = open(path, O_RDONLY | O_CLOEXEC);
-    if (fd < 0) {
+    UniqueFd fd = PMSOpenRegularFile(path);
+    if (!fd) {
         CORV_LOG_ERR("Failed to open file %s", path);
         return false;
     }
@@ -331,13 +332,12 @@ bool PMReadFile(const char* path, unsigned int limit, std::string& content,
     data.resize(want);
     unsigned long long got = 0;
     while (got < want) {
-        ssize_t n = VLIBCRead(fd, &data[got], want - got);
+        ssize_t n = VLIBCRead(fd.get(), &data[got], want - got);
         if (n <= 0) {
             break;
         }
         got += static_cast<unsigned long long>(n);
     }
-    close(fd);
     if (got != want) {
         CORV_LOG_ERR("Failed to read file %s", path);
         return false;

@@ -7,6 +7,7 @@
 #include <string>
 
 #include "catalogue/pkginfo_private.h"
+#include "common/regular_file.h"
 #include "common/vlibc_holders.h"
 #include "corv/log.h"
 #include "corv/vlibc.h"
@@ -130,8 +131,9 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
     info = PackageInfo();
     PackageInfoExtraPrivate* extra = info.extra.priv();
 
-    // 2. Not a package directory: quietly no.
-    if (!VLIBCFileCheckDir(dir.c_str()) || !VLIBCFileExist(infoPath.c_str())) {
+    // 2. Not a package directory: quietly no. An INFO that is no regular file (a named
+    // pipe would stall the read) is no INFO.
+    if (!VLIBCFileCheckDir(dir.c_str()) || !PMSIsRegularFile(infoPath)) {
         return false;
     }
 

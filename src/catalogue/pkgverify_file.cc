@@ -54,6 +54,11 @@ bool checkFile(const char* language, const char* cpkFile, PKG_ERRCODE& code, Jso
     // 4.
     if (!info.checksum.empty() && !pm.verifyPackageTgzFile(cpkFile, info.checksum.c_str())) {
         code = PKG_ERR_BAD_ARCHIVE;
+        // A payload that did not fit is no damage: say so beside the fixed report.
+        const Json::Value space = pm.getJsonParam("no_space");
+        if (space.isObject()) {
+            data["no_space"] = space;
+        }
         return false;
     }
     // 5.

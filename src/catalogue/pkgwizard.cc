@@ -9,6 +9,7 @@
 
 #include "catalogue/pkginfo_private.h"
 #include "catalogue/pkgwizard_private.h"
+#include "common/regular_file.h"
 #include "corv/log.h"
 #include "corv/process_runner.h"
 #include "corv/vlibc.h"
@@ -88,7 +89,9 @@ bool PMSExtractUIFile(const char* cpkFile, const char* dir, const std::string& m
         return false;
     }
     const std::string extracted = std::string(dir) + "/" + member;
-    if (extractMember(cpkFile, dir, member) != 0 || !VLIBCFileExist(extracted.c_str())) {
+    // A wizard script that is a link would run its target; a pipe would stall the read.
+    if (extractMember(cpkFile, dir, member) != 0 || !PMSCheckPackageMembers(dir) ||
+        !VLIBCFileExist(extracted.c_str())) {
         return false;
     }
     path = extracted;
@@ -143,8 +146,8 @@ bool PMSRunUIScript(const PackageInfo& info, const char* cpkFile, const std::str
 
 bool PMReadUIFileContent(const std::string& path, Json::Value& wizard) {
     // 1.
-    std::ifstream in(path);
-    if (!in.is_open()) {
+    std::string text;
+    if (!PMSReadRegularFile(path, text)) {
         CORV_LOG_ERR("Fail to read %s", path.c_str());
         return false;
     }
@@ -152,7 +155,7 @@ bool PMReadUIFileContent(const std::string& path, Json::Value& wizard) {
     // for the next wizard file.
     Json::Reader reader;
     Json::Value parsed;
-    if (!reader.parse(in, parsed)) {
+    if (!reader.parse(text, parsed)) {
         CORV_LOG_ERR("%s: %s", path.c_str(), reader.getFormattedErrorMessages().c_str());
         return false;
     }
@@ -252,7 +255,10 @@ bool PackageManager::queryPackageFileInfoWithWizard(const std::string& cpkFile, 
     }
     // 3. A package need not have a licence; a longer one is cut, not refused.
     const std::string license = tmp + "/LICENSE";
-    if (extractMember(cpkFile, tmp, "LICENSE") == 0 && VLIBCFileExist(license.c_str()) &&
+    if (extractMember(cpkFile, tmp, "LICENSE") == 0 && !PMSCheckPackageMembers(tmp)) {
+        return false;
+    }
+    if (VLIBCFileExist(license.c_str()) &&
         !PMReadFile(license.c_str(), kLicenseLimit, info.license, nullptr)) {
         CORV_LOG_ERR("Failed to read license file LICENSE in %s", cpkFile.c_str());
         return false;

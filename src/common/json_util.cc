@@ -9,6 +9,8 @@
 #include <memory>
 #include <sstream>
 
+#include "common/regular_file.h"
+
 namespace CORVPackageTool {
 
 std::string toString(const Json::Value& value) {
@@ -64,16 +66,11 @@ bool toFile(const Json::Value& value, const std::string& path) {
 
 bool fromFile(const std::string& path, Json::Value& value) {
     value = Json::Value();
-    std::ifstream in(path, std::ios::binary);
-    if (!in) {
+    std::string text;
+    if (!PMSReadRegularFile(path, text)) {
         return false;
     }
-    std::ostringstream buffer;
-    buffer << in.rdbuf();
-    if (in.bad()) {
-        return false;
-    }
-    return fromString(buffer.str(), value);
+    return fromString(text, value);
 }
 
 }  // namespace CORVPackageTool

@@ -171,6 +171,9 @@ int PackageManager::install(const char* userName, const std::string& cpkPath,
         }
         if (!retried) {
             setResult(spaceOr(PKG_ERR_VOLUME_CHECK));
+            if (getResult() == PKG_ERR_NO_SPACE) {
+                PMSReportNoSpace(*this, wanted, size + PKG_VOLUME_MARGIN, PMSFreeBytes(wanted));
+            }
             goto leave;
         }
     }

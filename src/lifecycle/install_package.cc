@@ -20,6 +20,7 @@
 #include "corv/user.h"
 #include "corv/vlibc.h"
 #include "corvpkg/packagemanager.h"
+#include "corvpkg/pkgfile.h"
 #include "corvpkg/pkglog.h"
 #include "corvpkg/pkgschedule.h"
 #include "corvpkg/pkgtool.h"
@@ -93,8 +94,9 @@ bool PMSUnpackAndCheck(PackageManager& pm, PKG_INSTALLATION_TYPE type, InstallCo
         return false;
     }
     // 4.
-    if (!PMSRunLogged(info, type, cmd.extractAll)) {
+    if (!PMSRunLogged(info, type, cmd.extractAll) || !PMSCheckPackageMembers(workDir)) {
         CORV_LOG_ERR("Failed to extract package, %s", cpkPath.c_str());
+        PMSExplainFailedUnpack(pm, workDir, PMSFileBytes(cpkPath));
         pm.setResult(PKG_ERR_BAD_ARCHIVE);
         return false;
     }
@@ -267,8 +269,10 @@ int PackageManager::install_package(const std::string& cpkPath, const std::strin
         goto final;
     }
     // 10.
-    if (!PMSRunLogged(info, type, cmd.extractPayload)) {
+    if (!PMSRunLogged(info, type, cmd.extractPayload) ||
+        !PMSDropSpecialFiles(workDir + "/package")) {
         CORV_LOG_ERR("Failed to unpack package.tgz, %s", cpkPath.c_str());
+        PMSExplainFailedUnpack(*this, workDir + "/package", PMSPayloadSize(info, workDir));
         setResult(PKG_ERR_BAD_ARCHIVE);
         goto final;
     }

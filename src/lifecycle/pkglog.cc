@@ -12,6 +12,7 @@
 
 #include <string>
 
+#include "common/regular_file.h"
 #include "corv/log.h"
 #include "corv/vlibc.h"
 #include "corvpkg/pkglog.h"
@@ -93,17 +94,16 @@ int PMSRunAndWriteScriptLog(const PackageInfo& info, PKG_INSTALLATION_TYPE type,
 
 std::string PMSReadPackageLog(const std::string& path) {
     std::string content;
-    FILE* f = fopen(path.c_str(), "re");
-    if (f == nullptr) {
+    UniqueFd fd = PMSOpenRegularFile(path);
+    if (!fd) {
         return content;
     }
     char block[kReadBlock + 1];
-    size_t n;
-    while (memset(block, 0, sizeof(block)), (n = fread(block, 1, kReadBlock, f)) > 0) {
+    ssize_t n;
+    while (memset(block, 0, sizeof(block)), (n = VLIBCRead(fd.get(), block, kReadBlock)) > 0) {
         // The text is for people: a NUL byte ends what is shown of its block.
         content.append(block, strlen(block));
     }
-    fclose(f);
     return content;
 }
 

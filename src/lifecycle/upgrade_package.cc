@@ -14,6 +14,7 @@
 #include "corv/process_runner.h"
 #include "corv/vlibc.h"
 #include "corvpkg/packagemanager.h"
+#include "corvpkg/pkgfile.h"
 #include "corvpkg/pkglog.h"
 #include "corvpkg/pkgtool.h"
 #include "corvpkg/pkgvolume.h"
@@ -129,8 +130,10 @@ int PackageManager::upgrade_package(const std::string& cpkPath, const std::strin
         goto final;
     }
     // 5.
-    if (!PMSRunLogged(newInfo, type, cmd.extractPayload)) {
+    if (!PMSRunLogged(newInfo, type, cmd.extractPayload) ||
+        !PMSDropSpecialFiles(workDir + "/package")) {
         CORV_LOG_ERR("Failed to unpack package.tgz, %s", cpkPath.c_str());
+        PMSExplainFailedUnpack(*this, workDir + "/package", PMSPayloadSize(newInfo, workDir));
         setResult(PKG_ERR_BAD_ARCHIVE);
         goto final;
     }

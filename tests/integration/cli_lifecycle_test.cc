@@ -1,9 +1,14 @@
 // The command line over the whole local life of a package, in the sandbox.
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
+#include <sys/statvfs.h>
 #include <unistd.h>
 
+#include <filesystem>
+#include <random>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -28,6 +33,12 @@ Json::Value json(const testutil::RunResult& r) {
     Json::Value out;
     EXPECT_TRUE(fromString(r.out, out)) << r.out << r.err;
     return out;
+}
+
+unsigned long long freeBytes(const char* path) {
+    struct statvfs vfs {};
+    return statvfs(path, &vfs) == 0 ? static_cast<unsigned long long>(vfs.f_bavail) * vfs.f_frsize
+                                    : 0;
 }
 
 int status(const std::string& name) {
@@ -148,6 +159,96 @@ TEST(CliLifecycle, BadInputIsRefusedClearly) {
         EXPECT_EQ(json(r)["name"].asString(), c.name) << r.out;
     }
     EXPECT_EQ(PackageManager().enumPackages(nullptr, PKG_INFO_MASK_ALL).size(), 0u);
+}
+
+TEST(CliLifecycle, NameThatLooksLikeAnOptionIsReachedAfterTheDoubleDash) {
+    // The name rules allow a leading "-"; "--" must then still reach the package.
+    const std::string file = testutil::buildPackage(testutil::recordingPackage("-rf"));
+    ASSERT_EQ(corvpkg({"install", "--no-verify", "--", file}).status, 0);
+    EXPECT_EQ(corvpkg({"status", "-rf"}).status, 2) << "an unknown option, as before";
+    const std::vector<std::vector<std::string>> steps = {
+        {"status", "--", "-rf"},    {"stop", "--", "-rf"},     {"start", "--", "-rf"},
+        {"restart", "--", "-rf"},   {"resource", "--", "-rf"}, {"log", "--", "-rf"},
+        {"uninstall", "--", "-rf"},
+    };
+    for (const auto& args : steps) {
+        testutil::RunResult r = corvpkg(args);
+        EXPECT_EQ(r.status, 0) << args[0] << ": " << r.out << r.err;
+    }
+    EXPECT_FALSE(testutil::exists("/var/packages/-rf"));
+}
+
+TEST(CliLifecycle, CommandsLeaveNoTemporaryFilesBehind) {
+    const std::string v1 = testutil::buildPackage(testutil::recordingPackage("demo", "1.0-0001"));
+    const std::string v2 = testutil::buildPackage(testutil::recordingPackage("demo", "2.0-0001"));
+    TestPackage failing = testutil::recordingPackage("other");
+    failing.scripts["preinst"] = "exit 1\n";
+    const std::string bad = testutil::buildPackage(failing);
+    const std::vector<std::vector<std::string>> commands = {
+        {"check", v1},
+        {"inspect", v1},
+        {"install", v1, "--no-verify"},
+        {"upgrade", v2, "--no-verify"},
+        {"install", bad, "--no-verify"},
+    };
+    auto temporaryEntries = [] {
+        std::set<std::string> entries;
+        for (const char* dir : {"/volume1/@tmp", "/var/tmp"}) {
+            std::error_code ec;
+            for (const auto& entry : std::filesystem::directory_iterator(dir, ec)) {
+                entries.insert(entry.path().string());
+            }
+        }
+        return entries;
+    };
+    const std::set<std::string> before = temporaryEntries();
+    for (const auto& args : commands) {
+        corvpkg(args);
+        EXPECT_EQ(temporaryEntries(), before) << args[0] << " " << args[1];
+    }
+    EXPECT_EQ(status("demo"), 0);
+}
+
+TEST(CliLifecycle, FullVolumeIsSaidInWords) {
+    // Random bytes do not compress: the payload needs its 12 MiB wherever it is unpacked.
+    TestPackage big = testutil::recordingPackage("big");
+    std::mt19937 random(7);
+    std::string noise(12 << 20, '\0');
+    for (char& c : noise) {
+        c = static_cast<char>(random());
+    }
+    big.payload["data.bin"] = noise;
+    const std::string file = testutil::buildPackage(big);
+    ASSERT_EQ(mkdir("/volume2", 0755), 0);
+    ASSERT_EQ(mount("tmpfs", "/volume2", "tmpfs", 0, "size=8m"), 0);
+    struct Case {
+        std::vector<std::string> args;
+        const char* volume;
+        const char* words;  // what the code alone would not say
+    } cases[] = {
+        {{"check", file}, "/volume1", "not installable: pkgmgr:broken_package"},
+        {{"install", file, "--no-verify"}, "/volume1", "pkgmgr:broken_package"},
+        {{"install", file, "--no-verify", "--volume", "/volume2"}, "/volume2", "PKG_ERR_NO_SPACE"},
+    };
+    for (const Case& c : cases) {
+        // The check unpacks the payload on the first volume with 10 MiB free: leave 11 there,
+        // or fill nothing when the volume asked for is the one too small.
+        if (std::string(c.volume) == "/volume1") {
+            const int fill = open("/volume1/fill", O_CREAT | O_WRONLY, 0600);
+            ASSERT_GE(fill, 0);
+            ASSERT_EQ(posix_fallocate(fill, 0, freeBytes("/volume1") - (11 << 20)), 0);
+            close(fill);
+        }
+        testutil::RunResult r = corvpkg(c.args);
+        unlink("/volume1/fill");
+        EXPECT_EQ(r.status, 1) << c.args[0];
+        EXPECT_NE((r.out + r.err).find(c.words), std::string::npos) << r.out << r.err;
+        EXPECT_NE(r.err.find(std::string("the volume ") + c.volume + " is full: "),
+                  std::string::npos)
+            << r.out << r.err;
+    }
+    EXPECT_FALSE(testutil::exists("/var/packages/big"));
+    umount2("/volume2", MNT_DETACH);
 }
 
 TEST(CliLifecycle, SavedDefaultVolumeWinsOverTheOption) {

@@ -248,8 +248,6 @@ TEST(Install, MissingPayloadArchiveFailsBeforeAnyScript) {
 }
 
 TEST(Install, FullVolumeDuringUnpackLeavesNothing) {
-    ASSERT_EQ(mkdir("/volume2", 0755), 0);
-    ASSERT_EQ(mount("tmpfs", "/volume2", "tmpfs", 0, "size=1m"), 0);
     TestPackage pkg = testutil::recordingPackage("demo");
     // Random bytes do not compress: the payload needs its full 3 MiB when unpacked.
     std::mt19937 random(42);
@@ -259,13 +257,23 @@ TEST(Install, FullVolumeDuringUnpackLeavesNothing) {
     }
     pkg.payload["data.bin"] = noise;
     const std::string file = testutil::buildPackage(pkg);
-    PackageManager pm;
-    EXPECT_EQ(installAt(pm, file, "/volume2"), 0);
-    EXPECT_EQ(pm.getResult(), PKG_ERR_BAD_ARCHIVE);
-    EXPECT_FALSE(testutil::exists("/var/packages/demo"));
-    EXPECT_FALSE(testutil::exists("/volume2/@tmp/pkginstall"));
-    EXPECT_TRUE(testutil::scriptsRan("demo").empty());
-    umount("/volume2");
+    ASSERT_EQ(mkdir("/volume2", 0755), 0);
+    // Too small for the package file's members; then room for those but not the payload too.
+    for (const char* size : {"size=1m", "size=5m"}) {
+        ASSERT_EQ(mount("tmpfs", "/volume2", "tmpfs", 0, size), 0);
+        PackageManager pm;
+        EXPECT_EQ(installAt(pm, file, "/volume2"), 0) << size;
+        EXPECT_EQ(pm.getResult(), PKG_ERR_BAD_ARCHIVE) << size;
+        // The code stays that of a failed unpack; the words say what really went wrong.
+        const Json::Value space = pm.getJsonParam("no_space");
+        EXPECT_EQ(space["volume"].asString(), "/volume2") << size << toString(space);
+        EXPECT_GE(space["needed"].asUInt64(), 3u << 20) << size << toString(space);
+        EXPECT_LT(space["free"].asUInt64(), space["needed"].asUInt64()) << size << toString(space);
+        EXPECT_FALSE(testutil::exists("/var/packages/demo")) << size;
+        EXPECT_FALSE(testutil::exists("/volume2/@tmp/pkginstall")) << size;
+        EXPECT_TRUE(testutil::scriptsRan("demo").empty()) << size;
+        ASSERT_EQ(umount("/volume2"), 0);
+    }
 }
 
 TEST(Install, PayloadThatCannotBeMovedLeavesNoRegistry) {

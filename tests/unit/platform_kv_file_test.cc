@@ -160,6 +160,11 @@ TEST(PlatformKvFile, UnreadableFilesFail) {
     EXPECT_EQ(VLIBCFileEnumSection(missing.c_str(), &keys.p), -1);
     EXPECT_EQ(VLIBCFileGetKeyValue(dir.path().c_str(), "a", buf, sizeof(buf), 0), -1);
     EXPECT_EQ(VLIBCErrGet(), ERR_IS_DIRECTORY);
+    // A named pipe without a writer would block the open and the read: it is no file.
+    const std::string fifo = dir.path() + "/fifo";
+    ASSERT_EQ(mkfifo(fifo.c_str(), 0644), 0);
+    EXPECT_EQ(VLIBCFileGetKeys(fifo.c_str(), keys.p, &hash.p, "="), -1);
+    EXPECT_EQ(VLIBCErrGet(), ERR_OPEN_FAILED);
 }
 
 TEST(PlatformKvFile, SizeLimit) {

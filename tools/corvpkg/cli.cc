@@ -27,9 +27,15 @@ bool parseCommon(const std::vector<std::string>& args, const Command& command, C
                  const std::vector<OptionSpec>& extra) {
     std::vector<OptionSpec> specs = {{"--json", false}, {"--lang", true}};
     specs.insert(specs.end(), extra.begin(), extra.end());
+    bool optionsEnded = false;
     for (size_t i = 0; i < args.size(); ++i) {
         const std::string& arg = args[i];
-        if (arg.size() < 2 || arg[0] != '-') {
+        // "--" ends the options, so that a package named "-x" can still be addressed.
+        if (!optionsEnded && arg == "--") {
+            optionsEnded = true;
+            continue;
+        }
+        if (optionsEnded || arg.size() < 2 || arg[0] != '-') {
             out.positional.push_back(arg);
             continue;
         }
@@ -81,6 +87,33 @@ int parseSingle(const std::vector<std::string>& args, const char* command, const
     return -1;
 }
 
+namespace {
+
+std::string inMiB(const Json::Value& bytes) {
+    char text[64];
+    snprintf(text, sizeof(text), "%.1f MiB", bytes.asDouble() / (1024.0 * 1024.0));
+    return text;
+}
+
+}  // namespace
+
+// A failure that came from a full volume, in words: a damaged-archive code alone would
+// send the user after the file.
+void printNoSpace(const Json::Value& data) {
+    if (!data.isObject()) {
+        return;
+    }
+    const Json::Value& space =
+        data.isMember("no_space") ? data["no_space"] : data["data"]["no_space"];
+    if (!space.isObject()) {
+        return;
+    }
+    fprintf(stderr, "the volume %s is full: %s (%s bytes) needed, %s (%s bytes) free\n",
+            space["volume"].asString().c_str(), inMiB(space["needed"]).c_str(),
+            space["needed"].asString().c_str(), inMiB(space["free"]).c_str(),
+            space["free"].asString().c_str());
+}
+
 int printFailure(bool json, int code, const std::string& reason, const Json::Value& data) {
     const CORVPackageTool::PKG_ERRCODE_INFO* info = CORVPackageTool::PMSGetErrCodeInfo(code);
     const char* name = info ? info->name : "PKG_ERR_UNKNOWN";
@@ -103,6 +136,7 @@ int printFailure(bool json, int code, const std::string& reason, const Json::Val
         printf("%s\n", CORVPackageTool::toString(out).c_str());
     } else {
         fprintf(stderr, "error: %s (%d): %s\n", name, code, text.c_str());
+        printNoSpace(data);
         if (key) {
             fprintf(stderr, "message key: %s\n", key);
         }

@@ -5,6 +5,7 @@
 #include <json/json.h>
 
 #include <map>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -57,6 +58,9 @@ int parseSingle(const std::vector<std::string>& args, const char* command, const
 // {"success":false,"code":N,"name":"...","reason":"...","data":...}. Returns EXIT_FAILED.
 int printFailure(bool json, int code, const std::string& reason,
                  const Json::Value& data = Json::Value());
+// When `data` (or its member "data") holds "no_space" ({"volume", "needed", "free"}),
+// says on standard error that the volume is full, with both sizes.
+void printNoSpace(const Json::Value& data);
 // The usage error path: message and the command's usage on standard error.
 int usageError(const Command& command, const std::string& message);
 
@@ -76,6 +80,24 @@ class LogCapture {
   private:
     std::vector<std::string> lines_;
 };
+
+// Removes, when it goes, the folders that appeared in the library's temporary folder while
+// it lived and hold no file: the checksum check of a package file leaves its empty outer
+// folder behind by rule.
+class TmpLeftovers {
+  public:
+    TmpLeftovers();
+    ~TmpLeftovers();
+    TmpLeftovers(const TmpLeftovers&) = delete;
+    TmpLeftovers& operator=(const TmpLeftovers&) = delete;
+
+  private:
+    std::string dir_;
+    std::set<std::string> before_;
+};
+// Removes the resource record that an upgrade of `name` in this process saved for the new
+// version and, by rule, leaves in /var/tmp.
+void removeResourceBackup(const std::string& name);
 
 int cmdInfo(const std::vector<std::string>& args);
 int cmdSystem(const std::vector<std::string>& args);

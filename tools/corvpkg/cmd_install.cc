@@ -177,6 +177,7 @@ int installCommand(const std::vector<std::string>& args, const char* command) {
     }
     const std::string lang = opts.lang.empty() ? "enu" : opts.lang;
     const bool verify = !opts.has("--no-verify");
+    TmpLeftovers leftovers;
     LogCapture log;
 
     // 1. The installability checks, so that a refusal comes with the desktop's report.
@@ -234,6 +235,7 @@ int installCommand(const std::vector<std::string>& args, const char* command) {
                              !opts.has("--no-start"), answers.empty() ? nullptr : &answers,
                              lang.c_str(), opts.has("--ignore-dependents"), verify);
     }
+    removeResourceBackup(info.package);
     std::string message;
     if (stampOf(messageFile) != before) {
         PMReadFile(messageFile.c_str(), 0x10000, message, nullptr);

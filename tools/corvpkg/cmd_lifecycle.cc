@@ -32,6 +32,10 @@ int printOperationOutcome(const CommonOptions& opts, PackageManager& pm, int out
     if (!(workerMsg.isString() && workerMsg.asString().empty())) {
         data["worker_msg"] = workerMsg;
     }
+    Json::Value noSpace = pm.getJsonParam("no_space");
+    if (noSpace.isObject()) {
+        data["no_space"] = noSpace;
+    }
     for (const char* key : {"deppkg", "oldver", "curver", "services"}) {
         const std::string value = pm.getMapParam(key);
         if (!value.empty()) {

@@ -72,6 +72,7 @@ int cmdInspect(const std::vector<std::string>& args) {
     if (!isReadableFile(file)) {
         return printFailure(opts.json, PKG_ERR_FILE_ACCESS, file + " is not a readable file");
     }
+    TmpLeftovers leftovers;
     PackageManager pm;
     LogCapture log;
     PackageInfo info;
@@ -112,6 +113,7 @@ int cmdCheck(const std::vector<std::string>& args) {
     if (!isReadableFile(file)) {
         return printFailure(opts.json, PKG_ERR_FILE_ACCESS, file + " is not a readable file");
     }
+    TmpLeftovers leftovers;
     PackageInfo info;
     PKG_ERRCODE code = PKG_OK;
     Json::Value data;
@@ -144,6 +146,7 @@ int cmdCheck(const std::vector<std::string>& args) {
         printf("%s: not installable: %s (%s)\n",
                displayName.empty() ? file.c_str() : displayName.c_str(), text.c_str(),
                codeInfo ? codeInfo->name : "PKG_ERR_UNKNOWN");
+        printNoSpace(data);
     }
     return ok ? EXIT_OK : EXIT_FAILED;
 }

@@ -213,7 +213,8 @@ void printHelp() {
         "usage: corvpkg <command> [options]\n"
         "       corvpkg --version | --help  (also -V, -h)\n"
         "       corvpkg <command> --help\n\n"
-        "The package engine of the NOS appliance.\n\ncommands:\n");
+        "The package engine of the NOS appliance. \"--\" ends a command's options: what\n"
+        "follows is taken as names and files, even when it begins with \"-\".\n\ncommands:\n");
     int width = 0;
     for (const cli::Command& command : cli::commands()) {
         width = std::max(width, static_cast<int>(strlen(command.name)));
@@ -247,6 +248,9 @@ int main(int argc, char** argv) {
         }
         std::vector<std::string> rest(args.begin() + 1, args.end());
         for (const std::string& arg : rest) {
+            if (arg == "--") {
+                break;
+            }
             if (arg == "--help" || arg == "-h") {
                 printf("%s", command.usage);
                 return cli::EXIT_OK;

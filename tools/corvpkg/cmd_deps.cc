@@ -6,6 +6,7 @@
 
 #include "cli.h"
 #include "corvpkg/corvpkg.h"
+#include "corvpkg/pkglint.h"
 
 namespace cli {
 
@@ -58,6 +59,16 @@ int cmdVersionCompare(const std::vector<std::string>& args) {
     PKG_VERSION_COMPOP op = parseOperator(args[1], ok);
     if (!ok) {
         return usageError(self, "unknown operator " + args[1]);
+    }
+    // The comparison reads any text, a word as 0: "abc" < "1.0" would hold.
+    for (const std::string& version : {args[0], args[2]}) {
+        if (!PMSIsVersionText(version)) {
+            fprintf(stderr,
+                    "corvpkg version-compare: \"%s\" is not a version (dotted numbers with an "
+                    "optional -build, e.g. 1.2.3-0045)\n",
+                    version.c_str());
+            return EXIT_USAGE;
+        }
     }
     // The relation of the first version to the second.
     PackageBasicInfo a("v", args[0]);

@@ -5,6 +5,7 @@
 #include <string>
 
 #include "cli.h"
+#include "cmd_kit.h"
 #include "corvpkg/corvpkg.h"
 #include "corvpkg/pkgbuild.h"
 #include "corvpkg/pkgfile.h"
@@ -31,7 +32,7 @@ Json::Value scriptNames(unsigned int mask) {
 int cmdBuild(const std::vector<std::string>& args) {
     CommonOptions opts;
     if (int status = parseSingle(args, "build", "package source directory", opts,
-                                 {{"-o", true}, {"--sign", true}});
+                                 {{"-o", true}, {"--sign", true}, {"--force", false}});
         status >= 0) {
         return status;
     }
@@ -43,6 +44,13 @@ int cmdBuild(const std::vector<std::string>& args) {
             return printFailure(opts.json, PKG_ERR_BROKEN, source + "/INFO does not read");
         }
         output = info.package + "-" + info.version + ".cpk";
+    }
+    // What the engine would refuse or drop is found here rather than on the target.
+    Json::Value lint(Json::objectValue);
+    if (!lintBeforeBuild(source, opts.has("--force"), opts.json ? &lint : nullptr)) {
+        return printFailure(opts.json, PKG_ERR_BROKEN,
+                            source + " has lint errors; fix them, or build anyway with --force",
+                            opts.json ? lint["lint"] : Json::Value());
     }
     LogCapture log;
     std::string error;
@@ -56,6 +64,7 @@ int cmdBuild(const std::vector<std::string>& args) {
         Json::Value out(Json::objectValue);
         out["success"] = true;
         out["file"] = output;
+        out["lint"] = lint["lint"];
         printf("%s\n", toString(out).c_str());
     } else {
         printf("built %s\n", output.c_str());

@@ -1,6 +1,7 @@
 // corvpkg list, status and log: what is installed and in which state.
 #include <stdio.h>
 
+#include <algorithm>
 #include <string>
 
 #include "cli.h"
@@ -28,7 +29,10 @@ int cmdList(const std::vector<std::string>& args) {
     PackageManager pm;
     const char* volume = opts.has("--volume") ? opts.options["--volume"].c_str() : nullptr;
     Json::Value rows(Json::arrayValue);
-    for (const std::string& name : pm.enumPackages(volume, kListMask)) {
+    // The registry lists in directory order; people look a name up alphabetically.
+    std::vector<std::string> names = pm.enumPackages(volume, kListMask);
+    std::sort(names.begin(), names.end());
+    for (const std::string& name : names) {
         PackageInfo info;
         pm.getInstallPackageInfo(name, info, opts.lang.empty() ? nullptr : opts.lang.c_str(),
                                  kListMask);

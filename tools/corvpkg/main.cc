@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "cli.h"
+#include "cmd_kit.h"
 #include "corvpkg/corvpkg.h"
 
 namespace cli {
@@ -65,7 +66,7 @@ const std::vector<Command>& commands() {
         {"list", "list the installed packages with version, status and volume",
          "usage: corvpkg list [--volume V] [--json] [--lang L]\n"
          "\n"
-         "Lists the packages of /var/packages in directory order, each with its version,\n"
+         "Lists the packages of /var/packages sorted by name, each with its version,\n"
          "its status (asked of its own status script) and the volume it lives on.\n"
          "  --volume V  only the packages on volume V (for example /volume1)\n"
          "  --json      print an array of objects\n",
@@ -114,8 +115,32 @@ const std::vector<Command>& commands() {
          "present, scripts/, conf/, WIZARD_UIFILES/, LICENSE and the icons. The source's\n"
          "INFO must read as the engine reads it (package, version, maintainer, description).\n"
          "  -o FILE     the package file (default <package>-<version>.cpk)\n"
-         "  --sign KEY  sign with the platform's signature tool, KEY from the caller's keyring\n",
+         "  --sign KEY  sign with the platform's signature tool, KEY from the caller's keyring\n"
+         "  --force     build although corvpkg lint finds errors (warnings never stop it)\n",
          cmdBuild},
+        {"lint", "check a package source or file for what the engine would refuse or drop",
+         "usage: corvpkg lint <source-dir | file.cpk> [--json]\n"
+         "\n"
+         "Checks the package by the rules the engine reads it with: INFO keys and values\n"
+         "(required keys, the name, version form, arch tokens, yes/no values, adminport, OS\n"
+         "versions, unknown keys), dependency lists in INFO, conf/PKG_DEPS and conf/PKG_CONX,\n"
+         "the wizard files' JSON, conf/resource against the workers of this system,\n"
+         "conf/privilege, the scripts' execute bits, and that control members are files.\n"
+         "Prints one line per finding: error or warning, the file, what is wrong, the fix.\n"
+         "  --json     print an array of {severity, file, problem, fix}\n"
+         "Exit status: 0 no errors (warnings allowed), 1 errors, 2 usage error.\n",
+         cmdLint},
+        {"new", "write a package source directory to start from",
+         "usage: corvpkg new <name> [dir] [--json]\n"
+         "\n"
+         "Writes a package source for <name> into [dir] (default ./<name>; it must not exist\n"
+         "or be empty): INFO, a payload program package/bin/<name>-daemon, a\n"
+         "start-stop-status that starts, stops and asks it, the other six scripts, an empty\n"
+         "install wizard and an empty conf/resource, each commented on what goes in it. It\n"
+         "lints clean and builds, installs and starts as it stands.\n"
+         "Exit status: 0 written, 1 failed (an illegal name, a directory in use), 2 usage\n"
+         "error.\n",
+         cmdNew},
         {"inspect", "show a package file's record, scripts, checksum and signature",
          "usage: corvpkg inspect <file.cpk> [--json] [--lang L]\n"
          "\n"

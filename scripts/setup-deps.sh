@@ -11,6 +11,7 @@ packages=(
     procps # pgrep, for scripts/check-sandbox.sh
     postgresql nginx-light cron # the daemons of the reference platform's system services
     libgpgme-dev gnupg # corv-codesign, the reference platform's package signature tool
+    libcpp-httplib-dev # corv-store, the package store server of the tests and the demo
 )
 
 missing=()

@@ -87,6 +87,12 @@ CORVPKG_API void PMSUnlockFile(int fd);
 // The text behind the last "/" of `url`, cut at its first "?"; a URL without "/" whole.
 CORVPKG_API void PMSParseUrlToFileName(const char* url, std::string& name);
 
+// What the last failed store transfer or reply of this process met, in words for people:
+// "the server could not be reached (...)", "the server's certificate is not trusted (...)",
+// "the server answered HTTP 500", "the reply is not JSON", ... Empty before any failure;
+// a success clears it. Not synchronised, like getResult().
+CORVPKG_API std::string PMSGetLastStoreFailure();
+
 // The transport's process-wide result code: the last failure of PMSDownloadFile as a
 // PKG_ERRCODE (a success does not reset it). Not synchronised.
 CORVPKG_API int getResult();

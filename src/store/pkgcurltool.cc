@@ -16,12 +16,47 @@
 #include "corv/nsinfo.h"
 #include "corv/vlibc.h"
 #include "corvpkg/pkgtypes.h"
+#include "store/pkgserver_private.h"
 
 namespace CORVPackageTool {
 
 namespace {
 
 int g_transportResult = 0;
+std::string g_lastFailure;
+
+// The words for a transfer that ended with `code`.
+std::string describeCurlFailure(CURLcode code, bool overLimit) {
+    const std::string detail = std::string(" (") + curl_easy_strerror(code) + ")";
+    switch (code) {
+        case CURLE_COULDNT_RESOLVE_PROXY:
+        case CURLE_COULDNT_RESOLVE_HOST:
+            return "the server's name could not be resolved" + detail;
+        case CURLE_COULDNT_CONNECT:
+        case CURLE_GOT_NOTHING:
+            return "the server could not be reached" + detail;
+        case CURLE_OPERATION_TIMEDOUT:
+            return "the server did not answer in time" + detail;
+        case CURLE_PEER_FAILED_VERIFICATION:
+        case CURLE_SSL_CACERT_BADFILE:
+            return "the server's certificate is not trusted" + detail;
+        case CURLE_SSL_CONNECT_ERROR:
+            return "the secure connection to the server failed" + detail;
+        case CURLE_TOO_MANY_REDIRECTS:
+            return "the server redirected too many times" + detail;
+        case CURLE_PARTIAL_FILE:
+        case CURLE_RECV_ERROR:
+            return "the reply was cut off" + detail;
+        case CURLE_WRITE_ERROR:
+            if (overLimit) {
+                return "the reply is larger than " + std::to_string(PKG_CURL_REPLY_LIMIT >> 20) +
+                       " MiB and was refused";
+            }
+            return "the reply could not be stored" + detail;
+        default:
+            return "the transfer failed" + detail;
+    }
+}
 
 // The reply body as it arrives; always NUL-terminated once anything arrived.
 struct ReplyBuffer {
@@ -154,6 +189,14 @@ bool setRedirectOptions(CURL* curl) {
 
 int getResult() {
     return g_transportResult;
+}
+
+std::string PMSGetLastStoreFailure() {
+    return g_lastFailure;
+}
+
+void PMSSetLastStoreFailure(const std::string& words) {
+    g_lastFailure = words;
 }
 
 int PMSCurlSetUserAgent(void* curl) {
@@ -364,6 +407,7 @@ bool PMSDownloadSendRequest(const char* url, bool post, std::string& reply, VLIB
     }
     if (code != CURLE_OK) {
         CORV_LOG_ERR("Failed to download %s, code=%d, err=%s", url, code, curl_easy_strerror(code));
+        g_lastFailure = describeCurlFailure(code, body.overLimit);
         if (isRetryable(code)) {
             reply = unreachableReply();
         }
@@ -378,12 +422,15 @@ bool PMSDownloadSendRequest(const char* url, bool post, std::string& reply, VLIB
     }
     if (status != 200) {
         CORV_LOG_ERR("%s, Failed to request packages, httpResponseCode=%ld", url, status);
+        g_lastFailure = "the server answered HTTP " + std::to_string(status);
         return false;
     }
     if (body.data == nullptr || body.length == 0) {
+        g_lastFailure = "the server sent an empty reply";
         return false;
     }
     reply.assign(body.data);
+    g_lastFailure.clear();
     return true;
 }
 
@@ -466,16 +513,22 @@ bool PMSDownloadFile(const char* url, const char* path, std::string* contentType
         g_transportResult = PKG_ERR_SERVER;
         CORV_LOG_ERR("Failed to download %s, code=%d, err=%s", url, code,
                      code < 0 ? "cannot open the file" : curl_easy_strerror((CURLcode)code));
+        g_lastFailure = code < 0 ? std::string("cannot write ") + path
+                                 : describeCurlFailure((CURLcode)code, false);
     }
     long status = 0;
     if (ok &&
         (curl_easy_getinfo(curl, CURLINFO_RESPONSE_CODE, &status) != CURLE_OK || status != 200)) {
         g_transportResult = PKG_ERR_SERVER;
         CORV_LOG_ERR("%s, Failed to request packages, httpResponseCode=%ld", url, status);
+        g_lastFailure = "the server answered HTTP " + std::to_string(status);
         ok = false;
     }
     if (ok) {
         ok = readTransferInfo(curl, url, contentType, effectiveUrl);
+    }
+    if (ok) {
+        g_lastFailure.clear();
     }
     PMSUnlockFile(lock);
     return ok;

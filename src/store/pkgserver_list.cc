@@ -11,6 +11,7 @@
 #include "corv/log.h"
 #include "corvpkg/json_util.h"
 #include "corvpkg/packagemanager.h"
+#include "corvpkg/pkgcurltool.h"
 #include "corvpkg/pkgserver.h"
 #include "corvpkg/pkgtool.h"
 #include "corvpkg/pkgvolume.h"
@@ -63,6 +64,7 @@ bool PMSParseReply(const std::string& reply, Json::Value& value) {
     }
     CORV_LOG_ERR("%s", errors.c_str());
     CORV_LOG_ERR("%s", reply.substr(0, kLoggedReplyLength).c_str());
+    PMSSetLastStoreFailure("the reply is not JSON");
     value = Json::Value();
     return false;
 }
@@ -146,6 +148,7 @@ bool CORVPackageServer::PMSQueryCorvPkgServer(bool force, const char* language, 
         // list; it is refused like a reply that is not JSON.
         if (!isList(result)) {
             CORV_LOG_ERR("Format error: jsData has no packages member");
+            PMSSetLastStoreFailure("the reply is not a package list");
             return false;
         }
         if (!cache.empty() && !toFile(result, cache)) {
@@ -283,8 +286,14 @@ bool CORVPackageServer::PMSQueryOtherPkgServer(bool force, const char* language,
         }
         const std::string feed = item["feed"].asString();
         Json::Value data, entries, keys;
-        if (!queryFeed(language, feed, data) || !feedEntries(data, entries, keys)) {
-            CORV_LOG_ERR("Skip the feed %s: no list from it", feed.c_str());
+        const bool queried = queryFeed(language, feed, data);
+        if (!queried || !feedEntries(data, entries, keys)) {
+            if (!queried) {
+                CORV_LOG_ERR("Skip the feed %s: %s", feed.c_str(),
+                             PMSGetLastStoreFailure().c_str());
+            } else {
+                CORV_LOG_ERR("Skip the feed %s: the reply is not a package list", feed.c_str());
+            }
             continue;
         }
         PMSUpdatePkgServerKey(feed, keys);

@@ -10,6 +10,10 @@
 
 namespace CORVPackageTool {
 
+// Records the words that PMSGetLastStoreFailure gives, for a reply that arrived but is
+// no good.
+void PMSSetLastStoreFailure(const std::string& words);
+
 // Whether a cache file is there and no more than an hour off the clock either way.
 // `st` receives its stat when not null.
 bool PMSIsCacheFresh(const std::string& path, struct stat* st);

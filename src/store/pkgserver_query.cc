@@ -19,6 +19,7 @@
 #include "corvpkg/pkgserver.h"
 #include "corvpkg/pkgtool.h"
 #include "store/json_value.h"
+#include "store/pkgserver_private.h"
 
 namespace CORVPackageTool {
 
@@ -154,9 +155,14 @@ bool CORVPackageServer::PMSQueryPkgServer(std::string language, std::string& rep
         return false;
     }
     std::string channel;
-    if (!setField(&fields.hash, "language", language) ||
-        !PMSReadConfValue(VLIBC_INFO_PATH, "package_update_channel", channel) ||
-        !setField(&fields.hash, "package_update_channel", channel)) {
+    if (!setField(&fields.hash, "language", language)) {
+        return false;
+    }
+    if (!PMSReadConfValue(VLIBC_INFO_PATH, "package_update_channel", channel)) {
+        PMSSetLastStoreFailure("no package_update_channel is set in " VLIBC_INFO_PATH);
+        return false;
+    }
+    if (!setField(&fields.hash, "package_update_channel", channel)) {
         return false;
     }
     if (extra.isObject()) {
@@ -167,6 +173,7 @@ bool CORVPackageServer::PMSQueryPkgServer(std::string language, std::string& rep
         }
     }
     if (!PMSAddCommonQueryFields(&fields.hash)) {
+        PMSSetLastStoreFailure("the device's timezone, unique or arch setting is missing");
         return false;
     }
     char target[4096] = {0};
@@ -174,6 +181,8 @@ bool CORVPackageServer::PMSQueryPkgServer(std::string language, std::string& rep
         char base[CORV_NSINFO_STORE_BUFFER] = {0};
         if (CORVMYNSServerConfigGet(base) < 0) {
             CORV_LOG_ERR("Failed to get package_server in %s.", VLIBC_INFO_DEFAULTS_PATH);
+            PMSSetLastStoreFailure(
+                "no maker store is set (package_server in " VLIBC_INFO_DEFAULTS_PATH ")");
             return false;
         }
         snprintf(target, sizeof target, "%s/api/getPackageList.php", base);

@@ -1,10 +1,12 @@
 #!/usr/bin/env bash
-# The demo's steps, run inside the sandbox by demo.sh. Argument: the corvpkg program.
+# The demo's steps, run inside the sandbox by demo.sh. Arguments: the corvpkg program and
+# the corv-store program.
 # The whole local life of two example packages (examples/README.md): build, check,
 # install with a wizard, run, upgrade, stop, start, uninstall. The sandbox vanishes
 # afterwards. Exits non-zero when a step does not end as the demo expects.
 set -uo pipefail
 corvpkg=$1
+store=${2:-$(dirname "$corvpkg")/../store/corv-store}
 cd "$(dirname "${BASH_SOURCE[0]}")/.."
 out=/tmp/examples
 failures=0
@@ -40,6 +42,33 @@ ask() {
     fi
 }
 
+# offers TITLE TEXT ARGS...: like step (expecting success), and the output must hold TEXT.
+offers() {
+    local title=$1 expected=$2 output status
+    shift 2
+    printf '\n==== %s\n$ corvpkg %s\n' "$title" "$*"
+    output=$("$corvpkg" "$@")
+    status=$?
+    printf '%s\n(exit status %d)\n' "$output" "$status"
+    if [ "$status" -ne 0 ] || ! printf '%s' "$output" | grep -qF -- "$expected"; then
+        printf '!!!! expected success and "%s" in the output\n' "$expected"
+        failures=$((failures + 1))
+    fi
+}
+
+# serve DIR PORT: starts corv-store over DIR on 127.0.0.1:PORT and waits until it answers.
+serve() {
+    "$store" serve "$1" --listen "127.0.0.1:$2" --log "$1.requests.log" >/dev/null &
+    servers+=($!)
+    for _ in $(seq 50); do
+        (exec 3<>"/dev/tcp/127.0.0.1/$2") 2>/dev/null && return 0
+        sleep 0.1
+    done
+    printf '!!!! corv-store did not start on port %s\n' "$2"
+    failures=$((failures + 1))
+}
+servers=()
+
 show() {
     printf '\n==== %s\n$ %s\n' "$1" "$2"
     bash -c "$2"
@@ -52,6 +81,22 @@ show "Build the example packages with 'corvpkg build'" \
 step "Look inside a package file" 0 inspect $out/greeter-1.0.0-0001.cpk
 step "Can it be installed? greeter needs hello running, and nobody signed the files" 1 \
     check $out/greeter-1.0.0-0001.cpk
+
+show "Publish the example packages as a store: 'corv-store index' writes the catalogue" \
+    "'$store' index $out && head -c 400 $out/catalogue.json && echo ..."
+show "Serve it on 127.0.0.1:8481, and an empty maker store on 127.0.0.1:8480" \
+    "mkdir -p /tmp/maker-store && '$store' index /tmp/maker-store &&
+     printf 'package_server=\"http://127.0.0.1:8480\"\n' >>/etc.defaults/corvinfo.conf"
+serve /tmp/maker-store 8480
+serve "$out" 8481
+step "Add the store as a feed" 0 feed add http://127.0.0.1:8481/feed
+step "The feeds" 0 feed list
+offers "What the stores offer: the feed's hello and greeter (its newest version)" \
+    "greeter                  1.1.0-0001" store list --refresh
+offers "greeter's store entry: what it needs, where to download it" \
+    "http://127.0.0.1:8481/greeter-1.1.0-0001.cpk" store info greeter
+show "What the feed store saw: one JSON line per request" \
+    "cut -c1-160 $out.requests.log"
 
 step "Install hello (unsigned, hence --no-verify); it starts after the install" 0 \
     install $out/hello-1.0.0-0001.cpk --no-verify
@@ -90,6 +135,10 @@ step "Installed packages" 0 list
 show "What greeter's scripts recorded (the record outlives the package)" \
     "cut -d' ' -f3- /usr/corv/etc/packages/greeter/scripts.log"
 show "The system event log" "cut -f2- /var/log/corvevents.log"
+
+for pid in "${servers[@]}"; do
+    kill "$pid" 2>/dev/null
+done
 
 if [ "$failures" -ne 0 ]; then
     printf '\n==== Demo finished with %d unexpected outcome(s)\n' "$failures"

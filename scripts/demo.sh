@@ -10,4 +10,5 @@ bash scripts/build.sh
 build=${CORV_BUILD_DIR:-build}
 # One sandbox for all steps, so that each step sees what the previous ones left.
 exec "$build/tools/sandbox/corv-sandbox" --init tools/platform/corv-platform-setup -- \
-    /bin/bash scripts/demo-steps.sh "$PWD/$build/tools/corvpkg/corvpkg"
+    /bin/bash scripts/demo-steps.sh "$PWD/$build/tools/corvpkg/corvpkg" \
+    "$PWD/$build/tools/store/corv-store"

@@ -12,6 +12,7 @@ packages=(
     postgresql nginx-light cron # the daemons of the reference platform's system services
     libgpgme-dev gnupg # corv-codesign, the reference platform's package signature tool
     help2man # the manual pages, written from corvpkg's help texts
+    libcpp-httplib-dev # corv-store, the package store server of the tests and the demo
 )
 
 missing=()

@@ -183,6 +183,12 @@ class CORVPKG_API PackageManager {
     // `name` and its ancestors within `pkgs`, in install order reversed (dependents first).
     bool getAncestryDependencyOrder(const char* name, std::vector<PackageInfo>& pkgs,
                                     std::vector<std::string>& order);
+    // `name` and its ancestors among the maker store's packages (pkgserver.h), dependents
+    // first, as PackageInfo records mapped from the store's entries. False with the result
+    // PKG_ERR_SYSTEM (bad argument, a dependency cycle), PKG_ERR_SERVER (no list from the
+    // store) or PKG_ERR_NOT_INSTALLED (the store has no such package).
+    bool getAncestryDepOrderByServer(const char* name, const char* language,
+                                     std::vector<PackageInfo>& pkgs);
     // The enabled packages that require one of `services` to start.
     void getDepServicePkgs(const std::set<std::string>& services, std::vector<PackageInfo>& pkgs);
     void getDepServicePkgs(const std::vector<unsigned int>& services,
@@ -221,9 +227,8 @@ class CORVPKG_API PackageManager {
     // and not empty, is the stop order to use. The outcome is the named package's only.
     // The lock is released on the way out unless `type` is 2 (an upgrade keeps it).
     int serviceControl(PKG_INSTALLATION_TYPE type, const std::string& name, bool start,
-                       const char* language, const char* userName,
-                       std::vector<std::string>* order, bool withDependents,
-                       bool restartRelated);
+                       const char* language, const char* userName, std::vector<std::string>* order,
+                       bool withDependents, bool restartRelated);
     // The user's start (type 8) or stop (type 0x10), with dependents and related daemons.
     int serviceControl(const std::string& name, bool start, const char* ignored);
     // Stop, and start again only if the stop succeeded.
@@ -271,8 +276,8 @@ class CORVPKG_API PackageManager {
 
     // Wizards. The steps of the wizard for `type` (1 install, 2 upgrade, 4 uninstall) go
     // to info.wizard; a package without one, or with a broken one, gets an empty wizard.
-    bool parseUIFile(const std::string& cpkFile, const std::string& dir,
-                     PKG_INSTALLATION_TYPE type, PackageInfo& info, const char* language);
+    bool parseUIFile(const std::string& cpkFile, const std::string& dir, PKG_INSTALLATION_TYPE type,
+                     PackageInfo& info, const char* language);
     // queryPackageFileInfo with the LICENSE and the wizard; type 0 means install or
     // upgrade, whichever fits what is installed.
     bool queryPackageFileInfoWithWizard(const std::string& cpkFile, PackageInfo& info,

@@ -20,6 +20,16 @@ namespace CORVPackageTool {
 CORVPKG_API bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* language,
                                     unsigned long long mask);
 
+// Maps a package server's entry into `info` without resetting it first: the members
+// package, version, dname, desc, maintainer, maintainer_url, distributor, distributor_url,
+// silent_install, silent_upgrade, silent_uninstall, link, size, type and md5 each replace
+// their field (a missing or mistyped member gives "", false or 0); "depsers" (text) gives
+// the install services; "conf_conxpkgs" (JSON form), else "conflictpkgs" (text), adds
+// conflicts; "conf_deppkgs" (JSON form) adds dependencies, and so does "deppkgs" only when
+// the entry also has a text member "deppgs". Every other field keeps its value.
+// False (logged) only when `entry` is not an object.
+CORVPKG_API bool PMSMapJsonToPackageInfo(const Json::Value& entry, PackageInfo& info);
+
 // Splits `text` at any character of `separators`; runs collapse, so no element is empty.
 CORVPKG_API std::vector<std::string> PMSExplodeString(const std::string& text,
                                                       const std::string& separators);

@@ -23,8 +23,9 @@ const char kCommand[] = "/usr/corv/bin/corvpkg chkupgradepkg";
 const char kWeekA[] = "~ ~ * * 1,2,3,4,6";
 const char kWeekB[] = "~ ~ * * 0,1,2,3,5";
 
-// The platform setup writes these two keys and nothing else into a fresh device's file.
-const char kFreshInfo[] = "language=\"enu\"\ntimezone=\"UTC\"\n";
+// The platform setup writes these three keys and nothing else into a fresh device's file.
+const char kFreshInfo[] =
+    "language=\"enu\"\ntimezone=\"UTC\"\npackage_update_channel=\"stable\"\n";
 
 class Schedule : public ::testing::Test {
   protected:

@@ -120,6 +120,9 @@ int cmdInstall(const std::vector<std::string>& args);
 int cmdUpgrade(const std::vector<std::string>& args);
 int cmdRepair(const std::vector<std::string>& args);
 int cmdUninstall(const std::vector<std::string>& args);
+int cmdStore(const std::vector<std::string>& args);
+int cmdFeed(const std::vector<std::string>& args);
+int cmdAutoupdate(const std::vector<std::string>& args);
 extern const char kWizardUsage[];
 
 // The end of an operation: on success "<done> <name>" (and any "worker_msg"); on failure

@@ -225,6 +225,46 @@ const std::vector<Command>& commands() {
          "  --lang L         language passed to the package's scripts\n"
          "Exit status: 0 uninstalled, 1 failed or refused, 2 usage error.\n",
          cmdUninstall},
+        {"store", "what the package stores offer: list, info <name>, deps <name>",
+         "usage: corvpkg store list [--refresh] [--json] [--lang L]\n"
+         "       corvpkg store info <name> [--json] [--lang L]\n"
+         "       corvpkg store deps <name> [--json] [--lang L]\n"
+         "\n"
+         "list  the maker store's packages and the feeds' merged, each after the packages it\n"
+         "      depends on, with the source it came from (\"maker\" or the feed's URL). A\n"
+         "      feed's package of a name that the maker store has is left out; of one name\n"
+         "      in several feeds the highest version stays. The lists are cached for an\n"
+         "      hour; --refresh asks the stores again.\n"
+         "info  one package's store entry: the maker store's, else the feeds'\n"
+         "deps  the order in which the package and what it needs would be installed, as\n"
+         "      the maker store's entries give it\n"
+         "The maker store is package_server in /etc.defaults/corvinfo.conf; the feeds are\n"
+         "those of \"corvpkg feed\". A failure says what went wrong: the store could not\n"
+         "be reached, its certificate is not trusted, it answered an error, its reply is\n"
+         "not JSON or not a package list, or it does not offer the package.\n"
+         "Exit status: 0, 1 failed, 2 usage error.\n",
+         cmdStore},
+        {"feed", "the feed servers: add <url>, remove <url>, list",
+         "usage: corvpkg feed add <url> [--json]\n"
+         "       corvpkg feed remove <url> [--json]\n"
+         "       corvpkg feed list [--json]\n"
+         "\n"
+         "Edits /usr/corv/etc/packages/feeds, the feed servers whose packages \"corvpkg\n"
+         "store list\" shows next to the maker store's. A feed is an http:// or https://\n"
+         "URL that answers a package list (\"corv-store serve\" answers at <address>/feed).\n"
+         "Removing a feed also has the signature tool forget the keys it brought.\n"
+         "Exit status: 0, 1 refused (bad URL, already there, not there), 2 usage error.\n",
+         cmdFeed},
+        {"autoupdate", "the packages updated automatically: list, set",
+         "usage: corvpkg autoupdate list [--json]\n"
+         "       corvpkg autoupdate set --all | --off | <name>... [--json]\n"
+         "\n"
+         "list  whether automatic update is off, on for all packages, or on for the chosen\n"
+         "      ones, and which those are\n"
+         "set   turns it on for all packages, off, or on for the named packages only; the\n"
+         "      update check's scheduler job follows\n"
+         "Exit status: 0, 1 failed, 2 usage error.\n",
+         cmdAutoupdate},
     };
     return table;
 }

@@ -11,6 +11,7 @@ packages=(
     procps # pgrep, for scripts/check-sandbox.sh
     postgresql nginx-light cron # the daemons of the reference platform's system services
     libgpgme-dev gnupg # corv-codesign, the reference platform's package signature tool
+    libkainjow-mustache-dev # the web server's rendering of package portal templates
 )
 
 missing=()

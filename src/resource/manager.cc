@@ -54,6 +54,9 @@ namespace Resource {
 const BuiltinWorker g_BuiltinWorkers[] = {
     {"service-cfg", 0x0012, NewServiceCfg},
     {"crontab-job", 0x0044, NewCrontabJob},
+    {"pgsql-db", 0x0011, NewPgsqlDB},
+    {"web-config", 0x0048, NewWebConfig},
+    {"web-config", 0x0012, NewWebConfigUserData},
     {"corvcrond", 0x0044, NewCorvCrond},
     {nullptr, 0, nullptr},
 };

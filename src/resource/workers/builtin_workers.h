@@ -9,6 +9,9 @@ namespace Resource {
 CORV::PkgUtils::IWorker* NewServiceCfg();
 CORV::PkgUtils::IWorker* NewCrontabJob();
 CORV::PkgUtils::IWorker* NewCorvCrond();
+CORV::PkgUtils::IWorker* NewPgsqlDB();
+CORV::PkgUtils::IWorker* NewWebConfig();
+CORV::PkgUtils::IWorker* NewWebConfigUserData();
 
 }  // namespace Resource
 }  // namespace CORVPackageTool

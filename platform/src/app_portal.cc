@@ -9,6 +9,7 @@
 #include <sstream>
 #include <string>
 
+#include "corv/certificate.h"
 #include "corv/csp_rule.h"
 #include "corv/log.h"
 #include "corv/vlibc.h"
@@ -160,6 +161,12 @@ std::string RenderPortalServer() {
     NOS nos(&engine);
     std::string server = "# The system web server with the packages' portals.\nserver {\n";
     server += "    listen " + std::to_string(nos.GetHttpPort()) + ";\n";
+    std::string certDir;
+    if (CORVCertDefaultDir(certDir)) {
+        server += "    listen " + std::to_string(nos.GetHttpsPort()) + " ssl;\n";
+        server += "    ssl_certificate " + certDir + "/fullchain.pem;\n";
+        server += "    ssl_certificate_key " + certDir + "/privkey.pem;\n";
+    }
     server += "    server_name _;\n";
     return server + locations + "}\n";
 }

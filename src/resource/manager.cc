@@ -58,6 +58,8 @@ const BuiltinWorker g_BuiltinWorkers[] = {
     {"web-config", 0x0048, NewWebConfig},
     {"web-config", 0x0012, NewWebConfigUserData},
     {"corvcrond", 0x0044, NewCorvCrond},
+    {"csp-rule", 0x0044, NewCspRule},
+    {"certificate-config", 0x0012, NewCertConfig},
     {nullptr, 0, nullptr},
 };
 

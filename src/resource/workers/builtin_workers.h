@@ -12,6 +12,8 @@ CORV::PkgUtils::IWorker* NewCorvCrond();
 CORV::PkgUtils::IWorker* NewPgsqlDB();
 CORV::PkgUtils::IWorker* NewWebConfig();
 CORV::PkgUtils::IWorker* NewWebConfigUserData();
+CORV::PkgUtils::IWorker* NewCspRule();
+CORV::PkgUtils::IWorker* NewCertConfig();
 
 }  // namespace Resource
 }  // namespace CORVPackageTool

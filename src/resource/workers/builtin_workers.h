@@ -14,6 +14,8 @@ CORV::PkgUtils::IWorker* NewWebConfig();
 CORV::PkgUtils::IWorker* NewWebConfigUserData();
 CORV::PkgUtils::IWorker* NewCspRule();
 CORV::PkgUtils::IWorker* NewCertConfig();
+CORV::PkgUtils::IWorker* NewWebAPIDesc();
+CORV::PkgUtils::IWorker* NewWebAPIDescDaemon();
 
 }  // namespace Resource
 }  // namespace CORVPackageTool

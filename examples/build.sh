@@ -3,6 +3,8 @@
 #   OUTDIR/hello-1.0.0-0001.cpk
 #   OUTDIR/greeter-1.0.0-0001.cpk
 #   OUTDIR/greeter-1.1.0-0001.cpk   the same source with the version raised, to upgrade to
+#   OUTDIR/notes-1.0.0-0001.cpk
+#   OUTDIR/notes-1.1.0-0001.cpk     likewise
 # usage: examples/build.sh CORVPKG OUTDIR
 set -eu
 
@@ -20,7 +22,7 @@ version_of() {
 }
 
 mkdir -p "$out"
-for name in hello greeter; do
+for name in hello greeter notes; do
     "$corvpkg" build "$here/$name" -o "$out/$name-$(version_of "$here/$name").cpk"
 done
 
@@ -28,6 +30,8 @@ done
 # every answer and its scripts write into their record.
 stage=$(mktemp -d)
 trap 'rm -rf "$stage"' EXIT
-cp -a "$here/greeter" "$stage/greeter"
-sed "s/^version=.*/version=\"$upgrade_version\"/" "$here/greeter/INFO" >"$stage/greeter/INFO"
-"$corvpkg" build "$stage/greeter" -o "$out/greeter-$upgrade_version.cpk"
+for name in greeter notes; do
+    cp -a "$here/$name" "$stage/$name"
+    sed "s/^version=.*/version=\"$upgrade_version\"/" "$here/$name/INFO" >"$stage/$name/INFO"
+    "$corvpkg" build "$stage/$name" -o "$out/$name-$upgrade_version.cpk"
+done

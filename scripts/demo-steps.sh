@@ -1,9 +1,10 @@
 #!/usr/bin/env bash
 # The demo's steps, run inside the sandbox by demo.sh. Arguments: the corvpkg program and
 # the corv-store program.
-# The whole local life of two example packages (examples/README.md): build, check,
-# install with a wizard, run, upgrade, stop, start, uninstall. The sandbox vanishes
-# afterwards. Exits non-zero when a step does not end as the demo expects.
+# The whole local life of the example packages (examples/README.md): build, check,
+# install with a wizard, run, upgrade, stop, start, uninstall; notes, a web app with its
+# own database behind the system web server; and the packages published by a store. The
+# sandbox vanishes afterwards. Exits non-zero when a step does not end as the demo expects.
 set -uo pipefail
 corvpkg=$1
 store=${2:-$(dirname "$corvpkg")/../store/corv-store}
@@ -25,13 +26,28 @@ step() {
     fi
 }
 
-# ask TITLE PORT EXPECTED_TEXT: one HTTP request to a daemon on the loopback interface,
-# with bash's own /dev/tcp (no curl on the machine needed).
+# ask TITLE PORT EXPECTED_TEXT [PATH [HEADER]]: one HTTP request to a daemon on the
+# loopback interface, with bash's own /dev/tcp (no curl on the machine needed). Prints the
+# body, and the header line named HEADER when given; the text is looked for in both. An
+# empty EXPECTED_TEXT expects nobody to answer. A web server reload takes effect a moment
+# after it is asked for, so an unexpected answer is asked again for up to 3 seconds.
 ask() {
-    local title=$1 port=$2 expected=$3 answer
-    printf '\n==== %s\n$ GET http://127.0.0.1:%s/\n' "$title" "$port"
-    answer=$(timeout 5 bash -c "exec 3<>/dev/tcp/127.0.0.1/$port &&
-        printf 'GET / HTTP/1.0\r\nHost: localhost\r\n\r\n' >&3 && cat <&3" 2>&1 | tr -d '\r')
+    local title=$1 port=$2 expected=$3 path=${4:-/} header=${5:-} answer tries=15
+    printf '\n==== %s\n$ GET http://127.0.0.1:%s%s\n' "$title" "$port" "$path"
+    while :; do
+        answer=$(timeout 5 bash -c "exec 3<>/dev/tcp/127.0.0.1/$port &&
+            printf 'GET %s HTTP/1.0\r\nHost: localhost\r\n\r\n' '$path' >&3 && cat <&3" 2>&1 |
+            tr -d '\r')
+        if [ -n "$expected" ]; then
+            printf '%s' "$answer" | grep -qF -- "$expected" && break
+        elif [ -z "$answer" ] || printf '%s' "$answer" | grep -q refused; then
+            break
+        fi
+        tries=$((tries - 1))
+        [ "$tries" -gt 0 ] || break
+        sleep 0.2
+    done
+    [ -z "$header" ] || printf '%s\n' "$answer" | sed -n '/^$/q;p' | grep -i "^$header:"
     printf '%s\n' "$answer" | sed -n '/^$/,$p' | sed '1d'
     if [ -n "$expected" ] && ! printf '%s' "$answer" | grep -qF -- "$expected"; then
         printf '!!!! expected an answer with "%s"\n' "$expected"
@@ -72,6 +88,18 @@ servers=()
 show() {
     printf '\n==== %s\n$ %s\n' "$1" "$2"
     bash -c "$2"
+}
+
+# check TITLE COMMAND EXPECTED_OUTPUT: runs a shell command and compares what it printed.
+check() {
+    local output
+    printf '\n==== %s\n$ %s\n' "$1" "$2"
+    output=$(bash -c "$2" 2>&1)
+    printf '%s\n' "$output"
+    if [ "$output" != "$3" ]; then
+        printf '!!!! expected "%s"\n' "$3"
+        failures=$((failures + 1))
+    fi
 }
 
 step "Version of the command line" 0 --version
@@ -132,6 +160,36 @@ step "hello cannot go while greeter depends on it" 1 uninstall hello
 step "Uninstall greeter" 0 uninstall greeter
 step "Uninstall hello" 0 uninstall hello
 step "Installed packages" 0 list
+# notes: a web app with a database of its own, behind the system web server.
+db_count="psql -X -U postgres -tAc \"SELECT count(*) FROM pg_database WHERE datname = 'notes'\""
+step "notes needs PostgreSQL: while it is down, the install fails before the package's scripts" 1 \
+    install $out/notes-1.0.0-0001.cpk --no-verify
+show "The platform's service manager starts PostgreSQL and nginx" \
+    "initctl start pgsql && initctl start nginx"
+step "Install notes: its user, its role and database, its portal in nginx" 0 \
+    install $out/notes-1.0.0-0001.cpk --no-verify
+ask "notes through the system web server, with the rules it asked for" 5000 "notes 1.0.0-0001" \
+    /notes/ Content-Security-Policy
+ask "Add a note (the text reaches SQL as a quoted literal only)" 5000 "added: buy milk" \
+    "/notes/add?text=buy+milk"
+ask "A note with a quote" 5000 "added: it's'); DROP TABLE notes; --" \
+    "/notes/add?text=it%27s%27%29%3B+DROP+TABLE+notes%3B+--"
+check "The notes, read as the package's role in its own database" \
+    "psql -X -U notes -d notes -tAc 'SELECT body FROM notes ORDER BY id'" \
+    "buy milk
+it's'); DROP TABLE notes; --"
+step "Upgrade notes to 1.1.0-0001: the database stays" 0 \
+    upgrade $out/notes-1.1.0-0001.cpk --no-verify
+ask "notes 1.1.0 shows the notes kept across the upgrade" 5000 "buy milk" /notes/
+step "Stop notes" 0 stop notes
+ask "A stopped package has no portal" 5000 "" /notes/
+step "Start notes" 0 start notes
+ask "notes answers again" 5000 "notes 1.1.0-0001" /notes/
+step "Uninstall notes" 0 uninstall notes
+ask "The portal is gone" 5000 "" /notes/
+check "Its database was dropped with it" "$db_count" "0"
+check "And its role" "psql -X -U postgres -tAc \"SELECT count(*) FROM pg_roles WHERE rolname = 'notes'\"" "0"
+
 show "What greeter's scripts recorded (the record outlives the package)" \
     "cut -d' ' -f3- /usr/corv/etc/packages/greeter/scripts.log"
 show "The system event log" "cut -f2- /var/log/corvevents.log"

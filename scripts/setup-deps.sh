@@ -13,6 +13,7 @@ packages=(
     libgpgme-dev gnupg # corv-codesign, the reference platform's package signature tool
     help2man # the manual pages, written from corvpkg's help texts
     libcpp-httplib-dev # corv-store, the package store server of the tests and the demo
+    libkainjow-mustache-dev # the web server's rendering of package portal templates
 )
 
 missing=()

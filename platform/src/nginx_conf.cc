@@ -11,6 +11,7 @@
 #include <sstream>
 #include <string>
 
+#include "app_portal.h"
 #include "corv/log.h"
 #include "corv/vlibc.h"
 
@@ -86,6 +87,7 @@ int NginxConfManager::run() {
         }
         VLIBCSzListFree(list);
     }
+    text += RenderPortalServer();
     const std::string path = GeneratedPath();
     std::string previous;
     bool hadPrevious = false;

@@ -8,6 +8,9 @@
 
 #include <string>
 
+#include "corv/firewall.h"
+#include "corv/nginx_conf.h"
+#include "corv/service.h"
 #include "corv/vlibc.h"
 
 namespace {
@@ -96,6 +99,19 @@ bool IsPortConflict(const char*, int from, int to) {
 namespace corvw3 {
 
 Engine::Engine() = default;
+
+bool Engine::W3FwReGenAll() {
+    if (NginxConfManager(4).run() < 0) {
+        return false;
+    }
+    // A reload of a web server that does not run is nothing to do (0).
+    return VLIBServiceReload("nginx") == 0;
+}
+
+bool Engine::HupFirewall() {
+    return CORVFwRuleHup() == 0;
+}
+
 NOS::NOS(Engine* engine) : engine_(engine) {}
 int NOS::GetHttpPort() const {
     return configuredPort("http_port", 5000);

@@ -53,8 +53,15 @@ namespace Resource {
 // Only the classes that exist have their rows; the others join at their place.
 const BuiltinWorker g_BuiltinWorkers[] = {
     {"service-cfg", 0x0012, NewServiceCfg},
+    {"webapi-desc", 0x0048, NewWebAPIDesc},
+    {"webapi-desc", 0x0048, NewWebAPIDescDaemon},
     {"crontab-job", 0x0044, NewCrontabJob},
+    {"pgsql-db", 0x0011, NewPgsqlDB},
+    {"web-config", 0x0048, NewWebConfig},
+    {"web-config", 0x0012, NewWebConfigUserData},
     {"corvcrond", 0x0044, NewCorvCrond},
+    {"csp-rule", 0x0044, NewCspRule},
+    {"certificate-config", 0x0012, NewCertConfig},
     {nullptr, 0, nullptr},
 };
 

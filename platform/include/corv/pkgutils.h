@@ -148,5 +148,8 @@ bool ResolveRelPath(const std::string& root, const std::string& relative, std::s
 bool InstallConfigFile(const std::string& source, const std::string& destination, mode_t mode,
                        bool replace);
 
+// InstallConfigFile for a program: the copy gets mode 0755.
+bool InstallExecutable(const std::string& source, const std::string& destination, bool replace);
+
 }  // namespace PkgUtils
 }  // namespace CORV

@@ -15,6 +15,11 @@ namespace corvw3 {
 class Engine {
   public:
     Engine();
+    // Regenerates the web server's configuration (NginxConfManager) and reloads the web
+    // server when it runs. True when both went well; false with the error slot set.
+    bool W3FwReGenAll();
+    // Reloads the firewall rules (CORVFwRuleHup). True on success.
+    bool HupFirewall();
 };
 
 class NOS {

@@ -9,6 +9,13 @@ namespace Resource {
 CORV::PkgUtils::IWorker* NewServiceCfg();
 CORV::PkgUtils::IWorker* NewCrontabJob();
 CORV::PkgUtils::IWorker* NewCorvCrond();
+CORV::PkgUtils::IWorker* NewPgsqlDB();
+CORV::PkgUtils::IWorker* NewWebConfig();
+CORV::PkgUtils::IWorker* NewWebConfigUserData();
+CORV::PkgUtils::IWorker* NewCspRule();
+CORV::PkgUtils::IWorker* NewCertConfig();
+CORV::PkgUtils::IWorker* NewWebAPIDesc();
+CORV::PkgUtils::IWorker* NewWebAPIDescDaemon();
 
 }  // namespace Resource
 }  // namespace CORVPackageTool

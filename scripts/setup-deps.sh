@@ -11,6 +11,8 @@ packages=(
     procps # pgrep, for scripts/check-sandbox.sh
     postgresql nginx-light cron # the daemons of the reference platform's system services
     libgpgme-dev gnupg # corv-codesign, the reference platform's package signature tool
+    syslog-ng-core logrotate # the logging daemons that packages' log fragments configure
+    libpam0g-dev pamtester # the platform's PAM modules, and signing in through packages' PAM files
 )
 
 missing=()

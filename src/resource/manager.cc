@@ -53,8 +53,11 @@ namespace Resource {
 // Only the classes that exist have their rows; the others join at their place.
 const BuiltinWorker g_BuiltinWorkers[] = {
     {"service-cfg", 0x0012, NewServiceCfg},
+    {"pam-config", 0x0088, NewPAMConfig},
+    {"syslog-config", 0x0044, NewSyslogConfig},
     {"crontab-job", 0x0044, NewCrontabJob},
     {"corvcrond", 0x0044, NewCorvCrond},
+    {"sysnotify", 0x0044, NewSysnotify},
     {nullptr, 0, nullptr},
 };
 

@@ -155,14 +155,28 @@ TEST(Catalogue, PhasesSelectTableRowsInTableOrder) {
 }
 
 TEST(Catalogue, TheLibrarysTableIsInItsFixedOrder) {
-    // Rows come with their worker classes, in the table's fixed order, ended by a null row.
-    const char* expected[] = {"service-cfg", "crontab-job", "corvcrond"};
+    // Rows come with their worker classes: whichever rows exist stand in this order, each
+    // once, ended by a null row.
+    const char* order[] = {
+        "sdk-plugin",      "service-cfg",        "indexdb",       "pam-config",
+        "syslog-config",   "userdata-collector", "webapi-desc",   "webapi-desc",
+        "data-share",      "data-share",         "data-share",    "crontab-job",
+        "port-config",     "pgsql-db",           "web-config",    "web-config",
+        "poweroff-config", "feasibility-config", "worker-plugin", "usr-local-linker",
+        "backup-backend",  "corvcrond",          "csp-rule",      "sysnotify",
+        "media-index",     "media-index",        "selfcheck",     "certificate-config"};
+    const size_t rows = sizeof(order) / sizeof(order[0]);
+    size_t next = 0;
     size_t i = 0;
     for (; g_BuiltinWorkers[i].id != nullptr; ++i) {
-        ASSERT_LT(i, sizeof(expected) / sizeof(expected[0]));
-        EXPECT_STREQ(g_BuiltinWorkers[i].id, expected[i]);
+        while (next < rows && std::string(order[next]) != g_BuiltinWorkers[i].id) {
+            ++next;
+        }
+        ASSERT_LT(next, rows) << "row " << i << " (" << g_BuiltinWorkers[i].id
+                              << ") is out of order or unknown";
+        ++next;
     }
-    EXPECT_EQ(i, sizeof(expected) / sizeof(expected[0]));
+    EXPECT_GE(i, 3u);
     EXPECT_EQ(DefaultCatalogue().table, g_BuiltinWorkers);
     EXPECT_EQ(DefaultCatalogue().providerDir, "/usr/local/share/corvpkg");
 }

@@ -9,6 +9,9 @@ namespace Resource {
 CORV::PkgUtils::IWorker* NewServiceCfg();
 CORV::PkgUtils::IWorker* NewCrontabJob();
 CORV::PkgUtils::IWorker* NewCorvCrond();
+CORV::PkgUtils::IWorker* NewPAMConfig();
+CORV::PkgUtils::IWorker* NewSyslogConfig();
+CORV::PkgUtils::IWorker* NewSysnotify();
 
 }  // namespace Resource
 }  // namespace CORVPackageTool

@@ -14,6 +14,8 @@ packages=(
     help2man # the manual pages, written from corvpkg's help texts
     libcpp-httplib-dev # corv-store, the package store server of the tests and the demo
     libkainjow-mustache-dev # the web server's rendering of package portal templates
+    syslog-ng-core logrotate # the logging daemons that packages' log fragments configure
+    libpam0g-dev pamtester # the platform's PAM modules, and signing in through packages' PAM files
 )
 
 missing=()

@@ -53,6 +53,8 @@ namespace Resource {
 // Only the classes that exist have their rows; the others join at their place.
 const BuiltinWorker g_BuiltinWorkers[] = {
     {"service-cfg", 0x0012, NewServiceCfg},
+    {"pam-config", 0x0088, NewPAMConfig},
+    {"syslog-config", 0x0044, NewSyslogConfig},
     {"webapi-desc", 0x0048, NewWebAPIDesc},
     {"webapi-desc", 0x0048, NewWebAPIDescDaemon},
     {"crontab-job", 0x0044, NewCrontabJob},
@@ -61,6 +63,7 @@ const BuiltinWorker g_BuiltinWorkers[] = {
     {"web-config", 0x0012, NewWebConfigUserData},
     {"corvcrond", 0x0044, NewCorvCrond},
     {"csp-rule", 0x0044, NewCspRule},
+    {"sysnotify", 0x0044, NewSysnotify},
     {"certificate-config", 0x0012, NewCertConfig},
     {nullptr, 0, nullptr},
 };

@@ -102,3 +102,63 @@ TEST_F(ResourceCli, FailuresSayWhy) {
     EXPECT_NE(providers.out.find("plug-in providers can't be read"), std::string::npos)
         << providers.out;
 }
+
+TEST_F(ResourceCli, SectionsNameTheirWorkersAndWarnAboutTheOthers) {
+    auto result = run(kCli, {"resource", "demo", "--json"});
+    ASSERT_EQ(result.status, 0) << result.err;
+    Json::Value out;
+    ASSERT_TRUE(CORVPackageTool::fromString(result.out, out)) << result.out;
+    EXPECT_EQ(CORVPackageTool::toString(out["sections"]),
+              R"([{"id":"list","workers":[]},{"id":"plain","workers":[{"interval":"0x0022",)"
+              R"("phases":["postinst","postuninst"],"provider":"prov"}]},)"
+              R"({"id":"port-like","workers":[]}])");
+    EXPECT_EQ(CORVPackageTool::toString(out["warnings"]),
+              R"(["the section \"list\" is not a JSON object: no worker runs for it",)"
+              R"("no worker handles the section \"port-like\": it is passed over"])");
+
+    auto text = run(kCli, {"resource", "demo"});
+    ASSERT_EQ(text.status, 0) << text.err;
+    EXPECT_NE(text.out.find("  plain                prov 0x0022 (postinst, postuninst)\n"),
+              std::string::npos)
+        << text.out;
+    EXPECT_NE(text.out.find("  port-like            no worker\n"), std::string::npos) << text.out;
+    EXPECT_NE(text.err.find("warning: no worker handles the section \"port-like\""),
+              std::string::npos)
+        << text.err;
+}
+
+TEST_F(ResourceCli, UpdateRunsTheWorkerOfTheSection) {
+    // sysnotify updates by acquiring again; syslog-config can't update.
+    testutil::writeFile("/var/packages/demo/conf/resource",
+                        R"({"sysnotify":{"texts_dir":"texts"},"syslog-config":{}})");
+    testutil::writeFile("/volume1/@appstore/demo/texts/enu/mails", "[DemoCliTag]\nTitle=\"t\"\n");
+    auto updated = run(kCli, {"resource", "update", "demo", "sysnotify", "--json"});
+    ASSERT_EQ(updated.status, 0) << updated.out << updated.err;
+    EXPECT_EQ(updated.out,
+              R"({"package":"demo","section":"sysnotify","success":true,"worker_msg":[]})"
+              "\n");
+    EXPECT_NE(testutil::readFile("/var/cache/texts/enu/mails").find("[DemoCliTag]"),
+              std::string::npos);
+
+    const struct {
+        std::vector<std::string> args;
+        int status;
+        const char* text;
+    } kCases[] = {
+        {{"resource", "update", "demo", "syslog-config"},
+         1,
+         "the worker of \"syslog-config\" does not update"},
+        {{"resource", "update", "demo", "nosuch-id"}, 1, "the update of \"nosuch-id\" failed"},
+        {{"resource", "update", "nosuch", "sysnotify"}, 1, "nosuch is not installed"},
+        {{"resource", "update", "demo"}, 2, "give a package name and a section to update"},
+        {{"resource", "update", "demo", "sysnotify", "--args", "[1]"},
+         2,
+         "--args must be a JSON object"},
+    };
+    for (const auto& c : kCases) {
+        auto result = run(kCli, c.args);
+        EXPECT_EQ(result.status, c.status) << c.args[2] << " " << c.args.back();
+        EXPECT_NE((result.out + result.err).find(c.text), std::string::npos)
+            << c.args.back() << ": " << result.out << result.err;
+    }
+}

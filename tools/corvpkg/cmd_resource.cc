@@ -1,5 +1,6 @@
-// corvpkg resource: what an installed package asks for, what it holds, and which workers
-// would run for it in each phase.
+// corvpkg resource: what an installed package asks for, what it holds, which workers serve
+// each section and run in each phase; and corvpkg resource update, which has the worker of
+// one section change the running resource.
 #include <stdio.h>
 
 #include <memory>
@@ -99,12 +100,84 @@ bool phaseWorkers(Resource::TIMING timing, const Json::Value& request, const Jso
     return true;
 }
 
+// Which workers serve each section of the request, over all phases; a section that no
+// worker serves, or that isn't an object, is passed over by every phase and earns a
+// warning.
+bool sectionWorkers(const Json::Value& request, Json::Value& sections, Json::Value& warnings) {
+    sections = Json::Value(Json::arrayValue);
+    warnings = Json::Value(Json::arrayValue);
+    if (!request.isObject()) {
+        return true;
+    }
+    std::vector<std::vector<std::shared_ptr<Resource::WorkerProxy>>> byPhase;
+    for (Resource::TIMING timing : kPhases) {
+        byPhase.emplace_back();
+        if (!Resource::FindRunnableWorkers(timing, byPhase.back())) {
+            return false;
+        }
+    }
+    for (const std::string& id : request.getMemberNames()) {
+        Json::Value section(Json::objectValue);
+        section["id"] = id;
+        section["workers"] = Json::Value(Json::arrayValue);
+        Json::Value& workers = section["workers"];
+        for (size_t phase = 0; phase < byPhase.size(); ++phase) {
+            for (const auto& proxy : byPhase[phase]) {
+                if (proxy->GetResourceID() != id) {
+                    continue;
+                }
+                const std::string interval = hex4(proxy->GetInterval());
+                Json::Value* worker = nullptr;
+                for (Json::Value& known : workers) {
+                    if (known["provider"] == proxy->GetProvider() &&
+                        known["interval"] == interval) {
+                        worker = &known;
+                    }
+                }
+                if (worker == nullptr) {
+                    Json::Value added(Json::objectValue);
+                    added["provider"] = proxy->GetProvider();
+                    added["interval"] = interval;
+                    added["phases"] = Json::Value(Json::arrayValue);
+                    worker = &workers.append(added);
+                }
+                (*worker)["phases"].append(Resource::TimingWord(kPhases[phase]));
+            }
+        }
+        if (!request[id].isObject()) {
+            warnings.append("the section \"" + id +
+                            "\" is not a JSON object: no worker runs for it");
+        } else if (workers.empty()) {
+            warnings.append("no worker handles the section \"" + id + "\": it is passed over");
+        }
+        sections.append(section);
+    }
+    return true;
+}
+
 void printText(const Json::Value& report) {
     printf("package: %s\n", report["package"].asCString());
     printf("request (%s, after substitution):\n", report["request_path"].asCString());
     printf("%s\n", report["request"].isNull() ? "  none" : pretty(report["request"]).c_str());
     printf("own (%s):\n", report["own_path"].asCString());
     printf("%s\n", report["own"].isNull() ? "  none" : pretty(report["own"]).c_str());
+    printf("sections:\n");
+    if (report["sections"].empty()) {
+        printf("  none\n");
+    }
+    for (const Json::Value& section : report["sections"]) {
+        std::string workers;
+        for (const Json::Value& worker : section["workers"]) {
+            std::string phases;
+            for (const Json::Value& phase : worker["phases"]) {
+                phases += (phases.empty() ? "" : ", ") + phase.asString();
+            }
+            workers += (workers.empty() ? "" : "; ") + worker["provider"].asString() + " " +
+                       worker["interval"].asString() + " (" + phases + ")";
+        }
+        printf("  %-20s %s\n", section["id"].asCString(),
+               workers.empty() ? "no worker" : workers.c_str());
+    }
     printf("workers by phase:\n");
     for (const Json::Value& phase : report["phases"]) {
         std::string names;
@@ -117,9 +190,7 @@ void printText(const Json::Value& report) {
     }
 }
 
-}  // namespace
-
-int cmdResource(const std::vector<std::string>& args) {
+int showResource(const std::vector<std::string>& args) {
     CommonOptions opts;
     if (int status = parseSingle(args, "resource", "package name", opts); status >= 0) {
         return status;
@@ -150,6 +221,12 @@ int cmdResource(const std::vector<std::string>& args) {
     }
     report["request"] = request;
     report["own"] = own;
+    if (!sectionWorkers(request, report["sections"], report["warnings"])) {
+        return printFailure(opts.json, PKG_ERR_SYSTEM,
+                            "the plug-in providers can't be read" +
+                                (log.reasons().empty() ? "" : ": " + log.reasons()),
+                            report);
+    }
 
     report["phases"] = Json::Value(Json::arrayValue);
     for (Resource::TIMING timing : kPhases) {
@@ -173,8 +250,80 @@ int cmdResource(const std::vector<std::string>& args) {
         printf("%s\n", toString(report).c_str());
     } else {
         printText(report);
+        for (const Json::Value& warning : report["warnings"]) {
+            fprintf(stderr, "warning: %s\n", warning.asCString());
+        }
     }
     return EXIT_OK;
+}
+
+// corvpkg resource update <name> <section> [--args JSON]: the worker of the section
+// changes the package's running resource, under the package lock.
+int updateResource(const std::vector<std::string>& args) {
+    const Command& self = findCommand("resource");
+    CommonOptions opts;
+    if (!parseCommon(args, self, opts, {{"--args", true}})) {
+        return EXIT_USAGE;
+    }
+    if (opts.positional.size() != 2) {
+        return usageError(self, "give a package name and a section to update");
+    }
+    const std::string& name = opts.positional[0];
+    const std::string& id = opts.positional[1];
+    Json::Value helperArgs(Json::objectValue);
+    if (opts.has("--args") &&
+        (!fromString(opts.options["--args"], helperArgs) || !helperArgs.isObject())) {
+        return usageError(self, "--args must be a JSON object");
+    }
+    PackageInfo info;
+    if (!isPackageName(name) ||
+        !PMSLoadPKGInfoFile("/var/packages/" + name, info, nullptr, PKG_INFO_MASK_ALL)) {
+        return printFailure(opts.json, PKG_ERR_NOT_INSTALLED, name + " is not installed");
+    }
+    if (!PackageManager::ExLock(180)) {
+        return printFailure(opts.json, PKG_ERR_LOCKED, "another package operation is running");
+    }
+    LogCapture log;
+    CORV::PkgUtils::WorkerResp resp;
+    VLIBCErrSetEx(0, "", 0);
+    const bool updated = Resource::Update(info, id, helperArgs, resp);
+    const int error = VLIBCErrGet();
+    PackageManager::UnLock();
+
+    Json::Value data(Json::objectValue);
+    data["package"] = name;
+    data["section"] = id;
+    data["worker_msg"] = resp.GetErrJsonArray();
+    if (!updated) {
+        data["error"] = hex4(static_cast<unsigned int>(error));
+        const std::string why = error == ERR_NOT_APPLICABLE
+                                    ? "the worker of \"" + id + "\" does not update"
+                                    : "the update of \"" + id + "\" failed";
+        const std::string reasons = log.reasons();
+        return printFailure(opts.json, PKG_ERR_SYSTEM,
+                            why + (reasons.empty() ? "" : ": " + reasons), data);
+    }
+    if (opts.json) {
+        data["success"] = true;
+        printf("%s\n", toString(data).c_str());
+    } else {
+        printf("updated %s of %s\n", id.c_str(), name.c_str());
+    }
+    return EXIT_OK;
+}
+
+}  // namespace
+
+int cmdResource(const std::vector<std::string>& args) {
+    size_t positional = 0;
+    for (const std::string& arg : args) {
+        positional += arg.compare(0, 2, "--") == 0 ? 0 : 1;
+    }
+    // "update" is a package name too, when it comes alone.
+    if (!args.empty() && args[0] == "update" && positional > 1) {
+        return updateResource(std::vector<std::string>(args.begin() + 1, args.end()));
+    }
+    return showResource(args);
 }
 
 }  // namespace cli

@@ -157,18 +157,22 @@ const std::vector<Command>& commands() {
          "desktop and the texts for its placeholders.\n"
          "Exit status: 0 installable, 1 not installable, 2 usage error.\n",
          cmdCheck},
-        {"resource", "show a package's resources: request, own-file, workers by phase",
+        {"resource", "show a package's resources: sections and their workers; update one",
          "usage: corvpkg resource <name> [--json]\n"
+         "       corvpkg resource update <name> <section> [--args JSON] [--json]\n"
          "\n"
          "Shows the installed package's conf/resource as its workers see it when no wizard\n"
-         "answers are given (placeholders that stay unresolved are dropped), its\n"
-         "conf/resource.own (what the workers recorded), and for each phase the workers\n"
-         "that would run, in running order: an acquire phase runs the workers of the ids\n"
-         "that the request asks for, a release phase (in reverse) those that the own-file\n"
-         "holds.\n"
+         "answers are given (placeholders that stay unresolved are dropped), which workers\n"
+         "serve each of its sections (provider, span, phases) with a warning for a section\n"
+         "that none serves, its conf/resource.own (what the workers recorded), and for each\n"
+         "phase the workers that would run, in running order: an acquire phase runs the\n"
+         "workers of the ids that the request asks for, a release phase (in reverse) those\n"
+         "that the own-file holds.\n"
+         "update has the worker of <section> change the running resource, with the JSON\n"
+         "object of --args as its \"@helper-args\"; not every worker can update.\n"
          "  --json     print one JSON object\n"
          "Exit status: 1 when the package is not installed, one of its files is unreadable,\n"
-         "or the plug-in providers can't be read.\n",
+         "the plug-in providers can't be read, or the update failed.\n",
          cmdResource},
         {"jobs", "show a package's generated init job and service configuration, and their state",
          "usage: corvpkg jobs <name> [--json]\n"

@@ -16,6 +16,9 @@ CORV::PkgUtils::IWorker* NewCspRule();
 CORV::PkgUtils::IWorker* NewCertConfig();
 CORV::PkgUtils::IWorker* NewWebAPIDesc();
 CORV::PkgUtils::IWorker* NewWebAPIDescDaemon();
+CORV::PkgUtils::IWorker* NewPAMConfig();
+CORV::PkgUtils::IWorker* NewSyslogConfig();
+CORV::PkgUtils::IWorker* NewSysnotify();
 
 }  // namespace Resource
 }  // namespace CORVPackageTool

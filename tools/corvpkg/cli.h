@@ -98,6 +98,12 @@ int cmdInstall(const std::vector<std::string>& args);
 int cmdUpgrade(const std::vector<std::string>& args);
 int cmdRepair(const std::vector<std::string>& args);
 int cmdUninstall(const std::vector<std::string>& args);
+int cmdStartAll(const std::vector<std::string>& args);
+int cmdStopAll(const std::vector<std::string>& args);
+int cmdServiceUp(const std::vector<std::string>& args);
+int cmdServiceDown(const std::vector<std::string>& args);
+extern const char kStartAllUsage[];
+extern const char kServiceUpUsage[];
 extern const char kWizardUsage[];
 
 // The end of an operation: on success "<done> <name>" (and any "worker_msg"); on failure

@@ -11,6 +11,8 @@ packages=(
     procps # pgrep, for scripts/check-sandbox.sh
     postgresql nginx-light cron # the daemons of the reference platform's system services
     libgpgme-dev gnupg # corv-codesign, the reference platform's package signature tool
+    acl libacl1-dev # shares of the reference platform: POSIX ACLs, getfacl in the tests
+    libsqlite3-dev sqlite3 # the reference platform's search and media index
 )
 
 missing=()

@@ -8,6 +8,7 @@
 
 #include <string>
 
+#include "corv/service_conf.h"
 #include "corv/vlibc.h"
 
 namespace {
@@ -88,7 +89,7 @@ bool IsPortConflict(const char*, int from, int to) {
         return false;
     }
     return listening("/proc/net/tcp", from, to) || listening("/proc/net/tcp6", from, to) ||
-           declaredByPackage(from, to);
+           declaredByPackage(from, to) || CORVServiceConfPortTaken("tcp", from, to, nullptr) == 1;
 }
 
 }  // namespace WebUtils

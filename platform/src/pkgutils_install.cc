@@ -89,5 +89,9 @@ bool InstallConfigFile(const std::string& source, const std::string& destination
     return true;
 }
 
+bool InstallExecutable(const std::string& source, const std::string& destination, bool replace) {
+    return InstallConfigFile(source, destination, 0755, replace);
+}
+
 }  // namespace PkgUtils
 }  // namespace CORV

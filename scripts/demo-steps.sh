@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
 # The demo's steps, run inside the sandbox by demo.sh. Argument: the corvpkg program.
-# The whole local life of two example packages (examples/README.md): build, check,
-# install with a wizard, run, upgrade, stop, start, uninstall. The sandbox vanishes
+# The whole local life of the example packages (examples/README.md): build, check,
+# install with a wizard, run, upgrade, stop, start, shutdown and boot, a share with its
+# ACLs, a port file and a command on PATH, uninstall. The sandbox vanishes
 # afterwards. Exits non-zero when a step does not end as the demo expects.
 set -uo pipefail
 corvpkg=$1
@@ -40,9 +41,13 @@ ask() {
     fi
 }
 
+# show TITLE COMMAND: runs a shell command; a non-zero exit status is an unexpected outcome.
 show() {
     printf '\n==== %s\n$ %s\n' "$1" "$2"
-    bash -c "$2"
+    if ! bash -c "$2"; then
+        printf '!!!! expected the command to succeed\n'
+        failures=$((failures + 1))
+    fi
 }
 
 step "Version of the command line" 0 --version
@@ -82,6 +87,26 @@ step "Start greeter" 0 start greeter
 ask "greeter answers again" 9123 "Hello from the demo"
 step "Restart greeter" 0 restart greeter
 step "greeter's own log" 0 log greeter
+
+step "Shutdown: every package stops, dependents first; enabled flags stay" 0 stop-all
+ask "greeter no longer answers" 9123 ""
+step "Boot: every enabled package starts again, dependencies first" 0 start-all
+ask "greeter answers after the boot" 9123 "Hello from the demo"
+
+show "Two users for the photos share" "useradd -M -N alice && useradd -M -N bob && id alice bob"
+step "Build photos: a share, a port file and a command linked into /usr/local/bin" 0 \
+    build examples/photos -o $out/photos-1.0.0-0001.cpk
+step "Install photos" 0 install $out/photos-1.0.0-0001.cpk --no-verify
+show "The share's ACLs: alice reads and writes, bob reads (an unknown user is left out)" \
+    "getfacl -p /volume1/photos"
+step "The machine lists the share" 0 system
+show "The port file, where the port-conflict check reads it" "cat /usr/local/etc/services.d/photos.sc"
+show "The linked command runs from PATH" \
+    "touch /volume1/photos/a.jpg /volume1/photos/b.jpg && ls -l /usr/local/bin/photos-count && PATH=/usr/local/bin:/usr/bin:/bin photos-count | grep '2 photo'"
+step "Stop photos: its command leaves PATH" 0 stop photos
+show "photos-count is gone" "! PATH=/usr/local/bin:/usr/bin:/bin command -v photos-count"
+step "Uninstall photos: the share and its photos stay" 0 uninstall photos
+show "The photos outlive the package" "ls /volume1/photos && getfacl -p /volume1/photos | grep alice"
 
 step "hello cannot go while greeter depends on it" 1 uninstall hello
 step "Uninstall greeter" 0 uninstall greeter

@@ -52,9 +52,24 @@ namespace Resource {
 //
 // Only the classes that exist have their rows; the others join at their place.
 const BuiltinWorker g_BuiltinWorkers[] = {
+    {"sdk-plugin", 0x0012, NewSDKPlugin},
     {"service-cfg", 0x0012, NewServiceCfg},
+    {"indexdb", 0x0044, NewIndexDB},
+    {"userdata-collector", 0x0012, NewUserDataCollector},
+    {"data-share", 0x0021, NewDataShareRecorder},
+    {"data-share", 0x0028, NewDataShare},
+    {"data-share", 0x0022, NewDataShare},
     {"crontab-job", 0x0044, NewCrontabJob},
+    {"port-config", 0x0022, NewPortConfig},
+    {"poweroff-config", 0x0044, NewPowerOffConfig},
+    {"feasibility-config", 0x0012, NewFeasibilityConfig},
+    {"worker-plugin", 0x0012, NewWorkerPlugin},
+    {"usr-local-linker", 0x0044, NewUsrLocalLinker},
+    {"backup-backend", 0x0044, NewBackupBackend},
     {"corvcrond", 0x0044, NewCorvCrond},
+    {"media-index", 0x0012, NewMediaIndex},
+    {"media-index", 0x0044, NewMediaIndexInfo},
+    {"selfcheck", 0x0012, NewSelfCheck},
     {nullptr, 0, nullptr},
 };
 

@@ -78,11 +78,12 @@ TEST(DataShareWorker, InstallMakesTheShareWithTheUsersACLsAndUninstallKeepsIt) {
     ASSERT_NO_FATAL_FAILURE(addUser("alice"));
     ASSERT_NO_FATAL_FAILURE(addUser("bob"));
     ASSERT_NO_FATAL_FAILURE(addUser("carol"));
-    // carol is in both lists and ends as read only; nosuch is no user and is passed over.
+    // carol is in both lists and ends as read only; nosuch and the names with odd
+    // characters are no users and are passed over.
     PackageManager pm;
     ASSERT_EQ(
         testutil::installBuilt(pm, sharing("photos", R"({"shares":[{"name":"media","permission":{
-                          "rw":["alice","carol","nosuch"],"ro":["bob","carol"]}}]})")),
+                          "rw":["alice","carol","nosuch","al,ice","x:y","../root"],"ro":["bob","carol"]}}]})")),
         1);
     EXPECT_EQ(acl("/volume1/media"),
               (std::vector<std::string>{"user:alice:rwx", "user:bob:r-x", "user:carol:r-x"}));

@@ -155,14 +155,37 @@ TEST(Catalogue, PhasesSelectTableRowsInTableOrder) {
 }
 
 TEST(Catalogue, TheLibrarysTableIsInItsFixedOrder) {
-    // Rows come with their worker classes, in the table's fixed order, ended by a null row.
-    const char* expected[] = {"service-cfg", "crontab-job", "corvcrond"};
+    // Rows come with their worker classes, each at its place in the table's fixed order
+    // (id and interval), ended by a null row.
+    const std::pair<const char*, unsigned int> order[] = {
+        {"sdk-plugin", 0x0012},      {"service-cfg", 0x0012},
+        {"indexdb", 0x0044},         {"pam-config", 0x0088},
+        {"syslog-config", 0x0044},   {"userdata-collector", 0x0012},
+        {"webapi-desc", 0x0048},     {"webapi-desc", 0x0048},
+        {"data-share", 0x0021},      {"data-share", 0x0028},
+        {"data-share", 0x0022},      {"crontab-job", 0x0044},
+        {"port-config", 0x0022},     {"pgsql-db", 0x0011},
+        {"web-config", 0x0048},      {"web-config", 0x0012},
+        {"poweroff-config", 0x0044}, {"feasibility-config", 0x0012},
+        {"worker-plugin", 0x0012},   {"usr-local-linker", 0x0044},
+        {"backup-backend", 0x0044},  {"corvcrond", 0x0044},
+        {"csp-rule", 0x0044},        {"sysnotify", 0x0044},
+        {"media-index", 0x0012},     {"media-index", 0x0044},
+        {"selfcheck", 0x0012},       {"certificate-config", 0x0012},
+    };
+    const size_t rows = sizeof(order) / sizeof(order[0]);
+    size_t at = 0;
     size_t i = 0;
-    for (; g_BuiltinWorkers[i].id != nullptr; ++i) {
-        ASSERT_LT(i, sizeof(expected) / sizeof(expected[0]));
-        EXPECT_STREQ(g_BuiltinWorkers[i].id, expected[i]);
+    for (; g_BuiltinWorkers[i].id != nullptr; ++i, ++at) {
+        while (at < rows && (std::string(order[at].first) != g_BuiltinWorkers[i].id ||
+                             order[at].second != g_BuiltinWorkers[i].interval)) {
+            ++at;
+        }
+        ASSERT_LT(at, rows) << "row " << i << " (" << g_BuiltinWorkers[i].id
+                            << ") is out of place or unknown";
+        EXPECT_NE(g_BuiltinWorkers[i].factory, nullptr) << g_BuiltinWorkers[i].id;
     }
-    EXPECT_EQ(i, sizeof(expected) / sizeof(expected[0]));
+    EXPECT_GE(i, 18u);
     EXPECT_EQ(DefaultCatalogue().table, g_BuiltinWorkers);
     EXPECT_EQ(DefaultCatalogue().providerDir, "/usr/local/share/corvpkg");
 }

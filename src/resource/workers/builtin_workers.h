@@ -9,6 +9,20 @@ namespace Resource {
 CORV::PkgUtils::IWorker* NewServiceCfg();
 CORV::PkgUtils::IWorker* NewCrontabJob();
 CORV::PkgUtils::IWorker* NewCorvCrond();
+CORV::PkgUtils::IWorker* NewSDKPlugin();
+CORV::PkgUtils::IWorker* NewDataShareRecorder();
+CORV::PkgUtils::IWorker* NewDataShare();
+CORV::PkgUtils::IWorker* NewPortConfig();
+CORV::PkgUtils::IWorker* NewWorkerPlugin();
+CORV::PkgUtils::IWorker* NewUsrLocalLinker();
+CORV::PkgUtils::IWorker* NewIndexDB();
+CORV::PkgUtils::IWorker* NewUserDataCollector();
+CORV::PkgUtils::IWorker* NewPowerOffConfig();
+CORV::PkgUtils::IWorker* NewFeasibilityConfig();
+CORV::PkgUtils::IWorker* NewBackupBackend();
+CORV::PkgUtils::IWorker* NewMediaIndex();
+CORV::PkgUtils::IWorker* NewMediaIndexInfo();
+CORV::PkgUtils::IWorker* NewSelfCheck();
 
 }  // namespace Resource
 }  // namespace CORVPackageTool

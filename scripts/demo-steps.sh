@@ -2,9 +2,10 @@
 # The demo's steps, run inside the sandbox by demo.sh. Arguments: the corvpkg program and
 # the corv-store program.
 # The whole local life of the example packages (examples/README.md): build, check,
-# install with a wizard, run, upgrade, stop, start, uninstall; notes, a web app with its
-# own database behind the system web server; and the packages published by a store. The
-# sandbox vanishes afterwards. Exits non-zero when a step does not end as the demo expects.
+# install with a wizard, run, upgrade, stop, start, shutdown and boot, uninstall; notes, a
+# web app with its own database behind the system web server; a share with its ACLs, a
+# port file and a command on PATH; and the packages published by a store. The sandbox
+# vanishes afterwards. Exits non-zero when a step does not end as the demo expects.
 set -uo pipefail
 corvpkg=$1
 store=${2:-$(dirname "$corvpkg")/../store/corv-store}
@@ -85,9 +86,13 @@ serve() {
 }
 servers=()
 
+# show TITLE COMMAND: runs a shell command; a non-zero exit status is an unexpected outcome.
 show() {
     printf '\n==== %s\n$ %s\n' "$1" "$2"
-    bash -c "$2"
+    if ! bash -c "$2"; then
+        printf '!!!! expected the command to succeed\n'
+        failures=$((failures + 1))
+    fi
 }
 
 # check TITLE COMMAND EXPECTED_OUTPUT: runs a shell command and compares what it printed.
@@ -155,6 +160,26 @@ step "Start greeter" 0 start greeter
 ask "greeter answers again" 9123 "Hello from the demo"
 step "Restart greeter" 0 restart greeter
 step "greeter's own log" 0 log greeter
+
+step "Shutdown: every package stops, dependents first; enabled flags stay" 0 stop-all
+ask "greeter no longer answers" 9123 ""
+step "Boot: every enabled package starts again, dependencies first" 0 start-all
+ask "greeter answers after the boot" 9123 "Hello from the demo"
+
+show "Two users for the photos share" "useradd -M -N alice && useradd -M -N bob && id alice bob"
+step "Build photos: a share, a port file and a command linked into /usr/local/bin" 0 \
+    build examples/photos -o $out/photos-1.0.0-0001.cpk
+step "Install photos" 0 install $out/photos-1.0.0-0001.cpk --no-verify
+show "The share's ACLs: alice reads and writes, bob reads (an unknown user is left out)" \
+    "getfacl -p /volume1/photos"
+step "The machine lists the share" 0 system
+show "The port file, where the port-conflict check reads it" "cat /usr/local/etc/services.d/photos.sc"
+show "The linked command runs from PATH" \
+    "touch /volume1/photos/a.jpg /volume1/photos/b.jpg && ls -l /usr/local/bin/photos-count && PATH=/usr/local/bin:/usr/bin:/bin photos-count | grep '2 photo'"
+step "Stop photos: its command leaves PATH" 0 stop photos
+show "photos-count is gone" "! PATH=/usr/local/bin:/usr/bin:/bin command -v photos-count"
+step "Uninstall photos: the share and its photos stay" 0 uninstall photos
+show "The photos outlive the package" "ls /volume1/photos && getfacl -p /volume1/photos | grep alice"
 
 step "hello cannot go while greeter depends on it" 1 uninstall hello
 step "Uninstall greeter" 0 uninstall greeter

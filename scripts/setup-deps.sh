@@ -16,6 +16,8 @@ packages=(
     libkainjow-mustache-dev # the web server's rendering of package portal templates
     syslog-ng-core logrotate # the logging daemons that packages' log fragments configure
     libpam0g-dev pamtester # the platform's PAM modules, and signing in through packages' PAM files
+    acl libacl1-dev # shares of the reference platform: POSIX ACLs, getfacl in the tests
+    libsqlite3-dev sqlite3 # the reference platform's search and media index
 )
 
 missing=()

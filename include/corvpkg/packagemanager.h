@@ -233,6 +233,14 @@ class CORVPKG_API PackageManager {
     int serviceControl(const std::string& name, bool start, const char* ignored);
     // Stop, and start again only if the stop succeeded.
     int serviceControlRestart(const std::string& name);
+    // Every package in dependency order with type 0 (enabled flags stay), at boot and
+    // shutdown; `filter` (comma-separated) with `key` leaves out the packages whose
+    // etc/corvpkg_conf/reg_<key> names none of its items. 1 when all went well.
+    int serviceControlOnOffALL(bool start, bool verbose, const char* filter, const char* key);
+    // The enabled packages that need one of `services`, with type 0. 1 when all went well.
+    int serviceControlByService(const std::set<std::string>& services, bool start, bool verbose);
+    int serviceControlByService(const std::vector<unsigned int>& services, bool start,
+                                bool verbose);  // an older form: does nothing, 0
     // What a package holds while enabled: the desktop link, `enabled`, the resources of
     // TIMING_DISABLE. Type 0 keeps all. Failures are logged and never change the result.
     void removePkgResources(PKG_INSTALLATION_TYPE type, const PackageInfo& info, MSG_TYPE msg);

@@ -11,6 +11,7 @@
 #include "corv/firewall.h"
 #include "corv/nginx_conf.h"
 #include "corv/service.h"
+#include "corv/service_conf.h"
 #include "corv/vlibc.h"
 
 namespace {
@@ -91,7 +92,7 @@ bool IsPortConflict(const char*, int from, int to) {
         return false;
     }
     return listening("/proc/net/tcp", from, to) || listening("/proc/net/tcp6", from, to) ||
-           declaredByPackage(from, to);
+           declaredByPackage(from, to) || CORVServiceConfPortTaken("tcp", from, to, nullptr) == 1;
 }
 
 }  // namespace WebUtils

@@ -2,13 +2,56 @@
 #include <stdio.h>
 
 #include <string>
+#include <vector>
 
+#include "corv/share.h"
 #include "corv/vlibc.h"
 #include "corv/volume.h"
 #include "corvpkg/pkgtool.h"
 #include "corvpkg/pkgvolume.h"
 
 namespace CORVPackageTool {
+
+namespace {
+
+Json::Value listOf(const std::string& text) {
+    Json::Value out(Json::arrayValue);
+    size_t start = 0;
+    while (start < text.size()) {
+        size_t comma = text.find(',', start);
+        if (comma == std::string::npos) {
+            comma = text.size();
+        }
+        if (comma > start) {
+            out.append(text.substr(start, comma - start));
+        }
+        start = comma + 1;
+    }
+    return out;
+}
+
+// The shared folders with their directories and who may write and read them.
+Json::Value sharesInfo() {
+    Json::Value out(Json::arrayValue);
+    std::vector<std::string> names;
+    CORVShareEnum(&names);
+    for (const std::string& name : names) {
+        PCORVSHARE share = nullptr;
+        if (CORVShareGet(name.c_str(), &share) != 0) {
+            continue;
+        }
+        Json::Value entry(Json::objectValue);
+        entry["name"] = name;
+        entry["path"] = share->path;
+        entry["rw"] = listOf(share->rwList);
+        entry["ro"] = listOf(share->roList);
+        out.append(entry);
+        CORVShareFree(share);
+    }
+    return out;
+}
+
+}  // namespace
 
 Json::Value PMSGetSystemInfo(unsigned long long installSize) {
     Json::Value out(Json::objectValue);
@@ -55,6 +98,7 @@ Json::Value PMSGetSystemInfo(unsigned long long installSize) {
         tmp["error"] = err;
     }
     out["temporary"] = tmp;
+    out["shares"] = sharesInfo();
     return out;
 }
 

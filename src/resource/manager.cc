@@ -50,20 +50,34 @@ namespace Resource {
 //   "selfcheck"           0x0012  SelfCheck
 //   "certificate-config"  0x0012  CertConfig
 //
-// Only the classes that exist have their rows; the others join at their place.
 const BuiltinWorker g_BuiltinWorkers[] = {
+    {"sdk-plugin", 0x0012, NewSDKPlugin},
     {"service-cfg", 0x0012, NewServiceCfg},
+    {"indexdb", 0x0044, NewIndexDB},
     {"pam-config", 0x0088, NewPAMConfig},
     {"syslog-config", 0x0044, NewSyslogConfig},
+    {"userdata-collector", 0x0012, NewUserDataCollector},
     {"webapi-desc", 0x0048, NewWebAPIDesc},
     {"webapi-desc", 0x0048, NewWebAPIDescDaemon},
+    {"data-share", 0x0021, NewDataShareRecorder},
+    {"data-share", 0x0028, NewDataShare},
+    {"data-share", 0x0022, NewDataShare},
     {"crontab-job", 0x0044, NewCrontabJob},
+    {"port-config", 0x0022, NewPortConfig},
     {"pgsql-db", 0x0011, NewPgsqlDB},
     {"web-config", 0x0048, NewWebConfig},
     {"web-config", 0x0012, NewWebConfigUserData},
+    {"poweroff-config", 0x0044, NewPowerOffConfig},
+    {"feasibility-config", 0x0012, NewFeasibilityConfig},
+    {"worker-plugin", 0x0012, NewWorkerPlugin},
+    {"usr-local-linker", 0x0044, NewUsrLocalLinker},
+    {"backup-backend", 0x0044, NewBackupBackend},
     {"corvcrond", 0x0044, NewCorvCrond},
     {"csp-rule", 0x0044, NewCspRule},
     {"sysnotify", 0x0044, NewSysnotify},
+    {"media-index", 0x0012, NewMediaIndex},
+    {"media-index", 0x0044, NewMediaIndexInfo},
+    {"selfcheck", 0x0012, NewSelfCheck},
     {"certificate-config", 0x0012, NewCertConfig},
     {nullptr, 0, nullptr},
 };

@@ -197,6 +197,7 @@ TEST(Examples, EveryExampleBuildsAndReadsBackAsItsSourceSays) {
          {"start-stop-status", "preinst", "postinst", "preuninst", "postuninst", "preupgrade",
           "postupgrade"},
          "hello>=1.0.0-0001"},
+        {"photos", "1.0.0-0001", {"start-stop-status"}, ""},
     };
     std::set<std::string> inTree;
     for (const auto& entry : std::filesystem::directory_iterator(kExamples)) {

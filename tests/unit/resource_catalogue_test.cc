@@ -155,33 +155,7 @@ TEST(Catalogue, PhasesSelectTableRowsInTableOrder) {
     }
 }
 
-TEST(Catalogue, TheLibrarysTableIsInItsFixedOrder) {
-    // Rows come with their worker classes, each at its place in the fixed order of all
-    // rows (id and interval), ended by a null row.
-    const std::vector<std::pair<std::string, unsigned int>> order = {
-        {"sdk-plugin", 0x12},        {"service-cfg", 0x12},      {"indexdb", 0x44},
-        {"pam-config", 0x88},        {"syslog-config", 0x44},    {"userdata-collector", 0x12},
-        {"webapi-desc", 0x48},       {"webapi-desc", 0x48},      {"data-share", 0x21},
-        {"data-share", 0x28},        {"data-share", 0x22},       {"crontab-job", 0x44},
-        {"port-config", 0x22},       {"pgsql-db", 0x11},         {"web-config", 0x48},
-        {"web-config", 0x12},        {"poweroff-config", 0x44},  {"feasibility-config", 0x12},
-        {"worker-plugin", 0x12},     {"usr-local-linker", 0x44}, {"backup-backend", 0x44},
-        {"corvcrond", 0x44},         {"csp-rule", 0x44},         {"sysnotify", 0x44},
-        {"media-index", 0x12},       {"media-index", 0x44},      {"selfcheck", 0x12},
-        {"certificate-config", 0x12}};
-    size_t at = 0;
-    size_t rows = 0;
-    for (; g_BuiltinWorkers[rows].id != nullptr; ++rows) {
-        const std::pair<std::string, unsigned int> row(g_BuiltinWorkers[rows].id,
-                                                       g_BuiltinWorkers[rows].interval);
-        while (at < order.size() && order[at] != row) {
-            ++at;
-        }
-        ASSERT_LT(at, order.size()) << "row " << rows << " " << row.first << " is out of order";
-        ++at;
-        EXPECT_NE(g_BuiltinWorkers[rows].factory, nullptr) << row.first;
-    }
-    EXPECT_GE(rows, 3u);
+TEST(Catalogue, TheDefaultCatalogueIsTheLibrarysTableAndProviderDirectory) {
     EXPECT_EQ(DefaultCatalogue().table, g_BuiltinWorkers);
     EXPECT_EQ(DefaultCatalogue().providerDir, "/usr/local/share/corvpkg");
 }

@@ -123,6 +123,12 @@ int cmdUninstall(const std::vector<std::string>& args);
 int cmdStore(const std::vector<std::string>& args);
 int cmdFeed(const std::vector<std::string>& args);
 int cmdAutoupdate(const std::vector<std::string>& args);
+int cmdStartAll(const std::vector<std::string>& args);
+int cmdStopAll(const std::vector<std::string>& args);
+int cmdServiceUp(const std::vector<std::string>& args);
+int cmdServiceDown(const std::vector<std::string>& args);
+extern const char kStartAllUsage[];
+extern const char kServiceUpUsage[];
 extern const char kWizardUsage[];
 
 // The end of an operation: on success "<done> <name>" (and any "worker_msg"); on failure

@@ -25,6 +25,25 @@ std::string humanBytes(unsigned long long bytes) {
     return buf;
 }
 
+std::string joined(const Json::Value& list) {
+    std::string out;
+    for (const Json::Value& item : list) {
+        out += (out.empty() ? "" : ",") + item.asString();
+    }
+    return out.empty() ? "-" : out;
+}
+
+void printShares(const Json::Value& shares) {
+    printf("shares:\n");
+    if (shares.empty()) {
+        printf("  (none)\n");
+    }
+    for (const Json::Value& s : shares) {
+        printf("  %-16s %s  rw: %s  ro: %s\n", s["name"].asCString(), s["path"].asCString(),
+               joined(s["rw"]).c_str(), joined(s["ro"]).c_str());
+    }
+}
+
 }  // namespace
 
 int cmdSystem(const std::vector<std::string>& args) {
@@ -76,6 +95,7 @@ int cmdSystem(const std::vector<std::string>& args) {
            tmp["dir"].asString().empty() ? ("(none, error " + tmp["error"].asString() + ")").c_str()
                                          : tmp["dir"].asCString(),
            humanBytes(tmp["install_size"].asUInt64()).c_str());
+    printShares(info["shares"]);
     return EXIT_OK;
 }
 

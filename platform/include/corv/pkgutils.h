@@ -147,6 +147,8 @@ bool ResolveRelPath(const std::string& root, const std::string& relative, std::s
 // (source unreadable), 0x0C00 (temporary file), 0x0B00 (write), 0x2800 (rename).
 bool InstallConfigFile(const std::string& source, const std::string& destination, mode_t mode,
                        bool replace);
+// InstallConfigFile of a program: the copy is executable by all (0755).
+bool InstallExecutable(const std::string& source, const std::string& destination, bool replace);
 
 // InstallConfigFile for a program: the copy gets mode 0755.
 bool InstallExecutable(const std::string& source, const std::string& destination, bool replace);

@@ -3,7 +3,8 @@
 
 namespace WebUtils {
 // Whether any TCP port from `from` to `to` (inclusive) is taken: a socket of this machine
-// listens on it, or an installed package declared it as its admin port. `protocol`
+// listens on it, an installed package declared it as its admin port, or a protocol file
+// of /usr/local/etc/services.d declares it for tcp (corv/service_conf.h). `protocol`
 // ("http", "https", ...) is carried over TCP in every case.
 bool IsPortConflict(const char* protocol, int from, int to);
 }  // namespace WebUtils

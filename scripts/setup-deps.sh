@@ -11,6 +11,8 @@ packages=(
     procps # pgrep, for scripts/check-sandbox.sh
     postgresql nginx-light cron # the daemons of the reference platform's system services
     libgpgme-dev gnupg # corv-codesign, the reference platform's package signature tool
+    pigz # the gzip that the reference platform gives tar for package payloads
+    clang libclang-rt-14-dev # libFuzzer and the sanitizers (scripts/fuzz.sh, scripts/test-asan.sh)
 )
 
 missing=()

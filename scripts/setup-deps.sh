@@ -18,6 +18,8 @@ packages=(
     libpam0g-dev pamtester # the platform's PAM modules, and signing in through packages' PAM files
     acl libacl1-dev # shares of the reference platform: POSIX ACLs, getfacl in the tests
     libsqlite3-dev sqlite3 # the reference platform's search and media index
+    pigz # the gzip that the reference platform gives tar for package payloads
+    clang libclang-rt-14-dev # libFuzzer and the sanitizers (scripts/fuzz.sh, scripts/test-asan.sh)
 )
 
 missing=()

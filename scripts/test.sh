@@ -18,6 +18,12 @@ status=0
 # hold the whole run.
 ctest --test-dir "$build" --output-on-failure -j2 --timeout 120 2>&1 | tee "$log" || status=$?
 
+# The unit tests again under AddressSanitizer and UBSan, and each fuzz target for a few
+# seconds from its seeds: a crash, a leak or undefined behaviour fails the run.
+extra=()
+bash scripts/test-asan.sh || { status=1; extra+=("sanitizer unit tests FAILED"); }
+bash scripts/fuzz.sh "${CORV_FUZZ_SECONDS:-5}" || { status=1; extra+=("fuzz targets FAILED"); }
+
 # ctest closes with its timing and the list of failures; repeat its summary last.
 summary=$(grep -E '^[0-9]+% tests passed' "$log" | tail -n 1 || true)
 if [[ -z $summary ]]; then
@@ -25,5 +31,8 @@ if [[ -z $summary ]]; then
     exit 1
 fi
 echo
+for line in "${extra[@]}"; do
+    echo "test.sh: $line"
+done
 echo "$summary"
 exit "$status"

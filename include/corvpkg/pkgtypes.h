@@ -6,8 +6,12 @@
 
 namespace CORVPackageTool {
 
+// The enumerations below have `int` as their fixed type: callers pass any integer they
+// were handed (a type 0 trigger, a status script's exit value), and without a fixed type a
+// value beyond the enumerators' bit range would be undefined.
+
 // The operation under way; single bits, so a combination has no meaning of its own.
-enum PKG_INSTALLATION_TYPE {
+enum PKG_INSTALLATION_TYPE : int {
     PKG_INSTALL = 0x01,
     PKG_UPGRADE = 0x02,
     PKG_UNINSTALL = 0x04,
@@ -17,7 +21,7 @@ enum PKG_INSTALLATION_TYPE {
 };
 
 // How a version relates to a bound, in comparisons and dependency entries.
-enum PKG_VERSION_COMPOP {
+enum PKG_VERSION_COMPOP : int {
     PKG_COMPOP_NONE = 0,
     PKG_COMPOP_EQ = 1,  // "="
     PKG_COMPOP_GT = 2,  // ">"
@@ -28,14 +32,14 @@ enum PKG_VERSION_COMPOP {
 
 // How a start or stop hands worker messages back: kept to the log, stored in the
 // manager's "worker_msg" parameter, or stored together with the package's script log.
-enum MSG_TYPE {
+enum MSG_TYPE : int {
     MSG_TYPE_LOG = 0,
     MSG_TYPE_PARAM = 1,
     MSG_TYPE_PARAM_AND_SCRIPT_LOG = 2,
 };
 
 // Numbers of the INFO keys; the key texts are in g_MappingPKGInfoFields.
-enum PKG_INFO_TYPE {
+enum PKG_INFO_TYPE : int {
     PKG_INFO_PACKAGE = 0,
     PKG_INFO_VERSION = 1,
     PKG_INFO_DESCRIPTION = 2,
@@ -88,7 +92,7 @@ constexpr unsigned long long PKG_INFO_MASK_ALL = 0xFFFFFFFFFFFFFFFFULL;
 
 // The result of every manager operation. The small values double as exit values of a
 // package's status script.
-enum PKG_ERRCODE {
+enum PKG_ERRCODE : int {
     PKG_OK = 0,
     PKG_STATUS_EXIT_1 = 1,
     PKG_STATUS_EXIT_2 = 2,

@@ -184,7 +184,7 @@ int VLIBCFileGetKeyValue(const char* path, const char* key, char* buffer, int si
         }
     });
     size_t n = value.size() < static_cast<size_t>(size) ? value.size() : size - 1;
-    memcpy(buffer, value.data(), n);
+    value.copy(buffer, n);  // an absent key has no data pointer at all
     buffer[n] = '\0';
     return static_cast<int>(n);
 }

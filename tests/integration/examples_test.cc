@@ -198,6 +198,7 @@ TEST(Examples, EveryExampleBuildsAndReadsBackAsItsSourceSays) {
           "postupgrade"},
          "hello>=1.0.0-0001"},
         {"photos", "1.0.0-0001", {"start-stop-status"}, ""},
+        {"notes", "1.0.0-0001", {"start-stop-status", "preupgrade"}, ""},
     };
     std::set<std::string> inTree;
     for (const auto& entry : std::filesystem::directory_iterator(kExamples)) {

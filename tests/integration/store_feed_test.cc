@@ -219,7 +219,8 @@ TEST(StoreCommandLine, APublishedFeedIsListedAndFailuresAreSaidInWords) {
     ASSERT_TRUE(fromString(listed.out, list)) << listed.out;
     EXPECT_EQ(merged(list["packages"], "source"),
               (std::vector<std::string>{"hello 1.0.0-0001 " + feed.base() + "/feed",
-                                        "greeter 1.1.0-0001 " + feed.base() + "/feed"}));
+                                        "greeter 1.1.0-0001 " + feed.base() + "/feed",
+                                        "notes 1.1.0-0001 " + feed.base() + "/feed"}));
     testutil::RunResult info = cli({"store", "info", "greeter"});
     ASSERT_EQ(info.status, 0) << info.err;
     EXPECT_NE(info.out.find("depends on:    hello"), std::string::npos) << info.out;

@@ -35,9 +35,6 @@ bool runLogged(const PackageInfo& info, PKG_INSTALLATION_TYPE type,
 
 }  // namespace
 
-std::string PMSRegistryDir(const std::string& name) {
-    return "/var/packages/" + name;
-}
 std::string PMSPackageEtcDir(const std::string& name) {
     return "/usr/corv/etc/packages/" + name;
 }

@@ -56,10 +56,6 @@ int askPackage(const PackageInfo& info, const std::string& script, const char* a
 
 }  // namespace
 
-std::string PMSEnabledFlagPath(const std::string& name) {
-    return PMSRegistryDir(name) + "/enabled";
-}
-
 void PMSNotifyAdministrators(const std::vector<std::string>& args) {
     std::vector<const char*> argv = {kNotifier, "-c", "CORV.NDS.PkgManApp.Instance", "-t", "false"};
     for (const std::string& arg : args) {

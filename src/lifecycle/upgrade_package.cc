@@ -12,6 +12,7 @@
 #include "corv/log.h"
 #include "corv/pkgutils.h"
 #include "corv/process_runner.h"
+#include "corv/service.h"
 #include "corv/vlibc.h"
 #include "corvpkg/packagemanager.h"
 #include "corvpkg/pkglog.h"
@@ -99,7 +100,20 @@ bool readInstalledInfo(UpgradeRoad& r) {
     return true;
 }
 
-// A package being repaired is brought up afterwards whatever its state.
+// Whether the init system holds the package's job up: running, or paused by a stop that
+// meant to bring it back (an upgrade or a shutdown that did not get to its end).
+bool jobHeldUp(const std::string& name) {
+    const std::string job = "pkgctl-" + name;
+    int state = VLIB_SERVICE_STATE_UNKNOWN;
+    return (VLIBServiceStatusGet(job.c_str(), &state) == 0 &&
+            state == VLIB_SERVICE_STATE_RUNNING) ||
+           VLIBServiceIsPaused(job.c_str()) == 1;
+}
+
+// A package being repaired is brought up afterwards whatever its state. Otherwise the
+// package runs again after the upgrade when it ran, or was meant to: an earlier upgrade,
+// start or stop cut short by a crash leaves the `enabled` flag or the held job as the only
+// word of it, and the package must not end stopped for the crash.
 bool noteRunningState(UpgradeRoad& r) {
     if (r.repair) {
         r.running = true;
@@ -110,6 +124,9 @@ bool noteRunningState(UpgradeRoad& r) {
     } else {
         r.wasEnabled = access(PMSEnabledFlagPath(r.oldInfo.package).c_str(), F_OK) == 0;
     }
+    // Also when the status cannot be had: an upgrade cut short after its resources went
+    // leaves the package without a job definition, but with its paused job's state.
+    r.running = r.running || r.wasEnabled || jobHeldUp(r.oldInfo.package);
     return true;
 }
 

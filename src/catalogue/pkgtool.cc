@@ -123,26 +123,26 @@ std::vector<std::string> PMSExplodeString(const std::string& text, const std::st
 
 bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* language,
                         unsigned long long mask) {
-    // 1. Paths, and a fresh record.
+    // Paths, and a fresh record.
     const std::string infoPath = dir + "/INFO";
     const std::string depsPath = dir + "/conf/PKG_DEPS";
     const std::string conxPath = dir + "/conf/PKG_CONX";
     info = PackageInfo();
     PackageInfoExtraPrivate* extra = info.extra.priv();
 
-    // 2. Not a package directory: quietly no.
+    // Not a package directory: quietly no.
     if (!VLIBCFileCheckDir(dir.c_str()) || !VLIBCFileExist(infoPath.c_str())) {
         return false;
     }
 
-    // 3. The keys to fetch and the values fetched.
+    // The keys to fetch and the values fetched.
     InfoKeys keys;
     if (!keys.ok()) {
         CORV_LOG_ERR("Out of memory!!");
         return false;
     }
 
-    // 4. Every key that is always read or that the mask selects.
+    // Every key that is always read or that the mask selects.
     for (const auto& [number, key] : g_MappingPKGInfoFields) {
         auto optional = g_MappingPKGInfoAdditional.find(number);
         if (optional == g_MappingPKGInfoAdditional.end() || (mask & optional->second) != 0) {
@@ -150,7 +150,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 5. Language variants, only when texts for display are wanted.
+    // Language variants, only when texts for display are wanted.
     std::string lang;
     if ((mask & (INFO_MASK_DESCRIPTION | INFO_MASK_DISPLAYNAME)) != 0) {
         lang = readLanguage(language);
@@ -171,14 +171,14 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 6. One read of the file.
+    // One read of the file.
     if (keys.load(infoPath.c_str()) < 0) {
         CORV_LOG_ERR("VLIBCFileGetKeys() failed!! szFile=[%s], corverr=[0x%04X]", infoPath.c_str(),
                      VLIBCErrGet());
         return false;
     }
 
-    // 7. The name.
+    // The name.
     const char* value = keys.get(PKG_INFO_PACKAGE);
     if (value == nullptr) {
         CORV_LOG_ERR("key [%s] not found in %s corverr=[0x%04X]", "package", infoPath.c_str(),
@@ -191,7 +191,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
     }
     info.package = value;
 
-    // 8. The version.
+    // The version.
     value = keys.get(PKG_INFO_VERSION);
     if (isEmpty(value)) {
         CORV_LOG_ERR("key [%s] not found", "version");
@@ -199,7 +199,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
     }
     info.version = value;
 
-    // 9. Maintainer and distributor.
+    // Maintainer and distributor.
     if (mask & INFO_MASK_MAINTAINER) {
         value = keys.get(PKG_INFO_MAINTAINER);
         if (isEmpty(value)) {
@@ -221,7 +221,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         info.distributor_url = value ? value : "";
     }
 
-    // 10. The description.
+    // The description.
     if (mask & INFO_MASK_DESCRIPTION) {
         value = keys.get(PKG_INFO_DESCRIPTION);
         if (isEmpty(value)) {
@@ -235,7 +235,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 11. The web entry of the package. The port check lets 65536 through on purpose.
+    // The web entry of the package. The port check lets 65536 through on purpose.
     if (mask & INFO_MASK_ADMIN) {
         value = keys.get(PKG_INFO_ADMINURL);
         if (value != nullptr) {
@@ -258,7 +258,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 12. Architectures and models.
+    // Architectures and models.
     value = keys.get(PKG_INFO_ARCH);
     if (isEmpty(value)) {
         info.arch = 0xFFFFFFFF;
@@ -274,7 +274,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         info.model_list = PMSExplodeString(value, " \t");
     }
 
-    // 13. OS versions: "os_min_ver" is the newer name of "firmware" and wins over it.
+    // OS versions: "os_min_ver" is the newer name of "firmware" and wins over it.
     value = keys.get(PKG_INFO_OS_MIN_VER);
     if (value == nullptr) {
         value = keys.get(PKG_INFO_FIRMWARE);
@@ -288,7 +288,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         PMSParseOSVersion(value, extra->os_max_ver);
     }
 
-    // 14. Texts in the wanted language.
+    // Texts in the wanted language.
     if (mask & INFO_MASK_DISPLAYNAME) {
         value = keys.get(PKG_INFO_DISPLAYNAME);
         info.displayname = value ? value : "";
@@ -306,7 +306,6 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 15.
     if (isNo(keys.get(PKG_INFO_CHECKPORT))) {
         info.checkport = false;
     }
@@ -317,7 +316,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 16. Daemons to restart and services required.
+    // Daemons to restart and services required.
     if (mask & INFO_MASK_RESTART_SERVICES) {
         info.instuninst_restart_services = static_cast<unsigned int>(
             PMSConvMapRestartService(keys.get(PKG_INFO_INSTUNINST_RESTART_SERVICES)));
@@ -335,7 +334,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         extra->start_dep_service_set = PackageManager::getServiceSetFromString(value);
     }
 
-    // 17. The UI directory name ends up in paths, so it obeys the name rule too.
+    // The UI directory name ends up in paths, so it obeys the name rule too.
     value = keys.get(PKG_INFO_NOSUIDIR);
     if (!isEmpty(value)) {
         if (!PMSIsLegalName(value, kUIDirNameForbidden)) {
@@ -351,7 +350,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 18. "ctl_stop" is the newer name of "startable" and alone decides when present.
+    // "ctl_stop" is the newer name of "startable" and alone decides when present.
     if ((mask & INFO_MASK_INSTALL_REBOOT) && isYes(keys.get(PKG_INFO_INSTALL_REBOOT))) {
         info.install_reboot = true;
     }
@@ -365,7 +364,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 19. Dependencies and conflicts: the section file, when there is one, replaces the
+    // Dependencies and conflicts: the section file, when there is one, replaces the
     // INFO key entirely.
     if (mask & INFO_MASK_DEP_PACKAGES) {
         if (VLIBCFileExist(depsPath.c_str())) {
@@ -382,7 +381,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 20. The rest cannot fail.
+    // The rest cannot fail.
     if ((mask & INFO_MASK_SILENT_INSTALL) && isYes(keys.get(PKG_INFO_SILENT_INSTALL))) {
         info.silent_install = true;
     }
@@ -445,7 +444,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         extra->ctl_uninstall = false;
     }
 
-    // 21. The list and hash go with `keys`.
+    // The list and hash go with `keys`.
     return true;
 }
 

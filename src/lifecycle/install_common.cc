@@ -226,6 +226,7 @@ int PMSRunInstallScript(const PackageInfo& info, const std::string& script, cons
                         PKG_INSTALLATION_TYPE type, const ScriptContext& ctx, bool dumpEnv,
                         const std::string& identityDir) {
     CORVUtils::ProcessRunner runner(script, {});
+    runner.setArgZero(action);
     for (const auto& [name, value] : ctx.variables) {
         runner.addEnv(name, value);
     }

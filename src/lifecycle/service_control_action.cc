@@ -45,6 +45,7 @@ int askPackage(const PackageInfo& info, const std::string& script, const char* a
                bool identity, PKG_INSTALLATION_TYPE type, const char* language,
                const std::string& logFile, const char* userName) {
     CORVUtils::ProcessRunner runner(script, {action});
+    runner.setArgZero("start-stop-status");
     if (identity && !Privilege::SetIdentity(runner, info.package, action, "")) {
         CORV_LOG_ERR("Failed to set identity for %s [0x%04X %s:%d]", info.package.c_str(),
                      VLIBCErrGet(), VLIBCErrorGetFile(), VLIBCErrorGetLine());

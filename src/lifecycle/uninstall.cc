@@ -96,6 +96,7 @@ bool runPreuninst(UninstallRoad& r) {
         return true;
     }
     CORVUtils::ProcessRunner runner(script, {});
+    runner.setArgZero("preuninst");
     PMSPrepareScriptEnv(r.info, runner, r.language, &r.logFile, r.type, r.extra, nullptr, nullptr,
                         r.userName);
     bool refused = false;
@@ -165,6 +166,7 @@ bool runPostuninst(UninstallRoad& r) {
         return true;
     }
     CORVUtils::ProcessRunner runner(script, {});
+    runner.setArgZero("postuninst");
     PMSPrepareScriptEnv(r.info, runner, r.language, &r.logFile, r.type, r.extra, nullptr, nullptr,
                         nullptr);
     r.resp.DumpEnv(runner);

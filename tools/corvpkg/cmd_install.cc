@@ -179,7 +179,7 @@ int installCommand(const std::vector<std::string>& args, const char* command) {
     const bool verify = !opts.has("--no-verify");
     LogCapture log;
 
-    // 1. The installability checks, so that a refusal comes with the desktop's report.
+    // The installability checks, so that a refusal comes with the desktop's report.
     PackageInfo info;
     PKG_ERRCODE code = PKG_OK;
     Json::Value data;
@@ -198,7 +198,7 @@ int installCommand(const std::vector<std::string>& args, const char* command) {
         return printFailure(opts.json, code, "not installable: " + text, details);
     }
 
-    // 2. The wizard's questions.
+    // The wizard's questions.
     PackageManager pm;
     PackageInfo withWizard;
     pm.queryPackageFileInfoWithWizard(file, withWizard, static_cast<PKG_INSTALLATION_TYPE>(0),
@@ -221,7 +221,7 @@ int installCommand(const std::vector<std::string>& args, const char* command) {
         }
     }
 
-    // 3. The message file may hold the words of an earlier operation: only a file that
+    // The message file may hold the words of an earlier operation: only a file that
     // this one wrote is the package's message now.
     const std::string messageFile = pm.getFixedLogFilePath(info.package);
     const FileStamp before = stampOf(messageFile);

@@ -17,6 +17,7 @@
 
 #include "corv/log.h"
 #include "corv/vlibc.h"
+#include "io_util.h"
 
 namespace CORV {
 namespace CORVCrond {
@@ -90,23 +91,7 @@ bool WriteAtomically(const std::string& path, const std::string& text, mode_t mo
     if (CORVFSMkdirP(path.substr(0, path.rfind('/')).c_str(), nullptr, 1, -1, -1, 0755) != 0) {
         return false;
     }
-    std::string tmp = path + ".XXXXXX";
-    const int fd = mkstemp(&tmp[0]);
-    if (fd < 0) {
-        CORV_LOG_ERR("Failed to create tmp file for %s (%m)", path.c_str());
-        VLIBCErrSet(ERR_CREATE_FAILED);
-        return false;
-    }
-    const bool ok = write(fd, text.data(), text.size()) == static_cast<ssize_t>(text.size()) &&
-                    fchmod(fd, mode) == 0;
-    close(fd);
-    if (!ok || rename(tmp.c_str(), path.c_str()) != 0) {
-        CORV_LOG_ERR("Failed to write %s (%m)", path.c_str());
-        VLIBCErrSet(ok ? ERR_RENAME_FAILED : ERR_WRITE_FAILED);
-        unlink(tmp.c_str());
-        return false;
-    }
-    return true;
+    return corvplat::replaceWhole(path, text, mode, nullptr);
 }
 
 bool UnlinkIfThere(const std::string& path) {

@@ -12,6 +12,7 @@
 #include "corv/log.h"
 #include "corv/vlibc.h"
 #include "init_job.h"
+#include "io_util.h"
 
 namespace CORVInit {
 
@@ -125,41 +126,7 @@ int WriteJobState(const std::string& name, const JobState& state) {
 }
 
 int ReplaceFileText(const std::string& path, const std::string& content, int mode) {
-    std::string tmp = path + ".XXXXXX";
-    int fd = mkostemp(&tmp[0], O_CLOEXEC);
-    if (fd < 0) {
-        CORV_LOG_ERR("Failed to create a temporary file for %s, %m", path.c_str());
-        VLIBCErrSet(errno == ENOSPC ? ERR_NO_SPACE : ERR_CREATE_FAILED);
-        return -1;
-    }
-    size_t done = 0;
-    while (done < content.size()) {
-        ssize_t n = write(fd, content.data() + done, content.size() - done);
-        if (n < 0 && errno == EINTR) {
-            continue;
-        }
-        if (n <= 0) {
-            break;
-        }
-        done += static_cast<size_t>(n);
-    }
-    const bool written = done == content.size() && fchmod(fd, static_cast<mode_t>(mode)) == 0;
-    const int err = errno;
-    close(fd);
-    if (!written) {
-        errno = err;
-        CORV_LOG_ERR("Failed to write %s, %m", tmp.c_str());
-        unlink(tmp.c_str());
-        VLIBCErrSet(err == ENOSPC ? ERR_NO_SPACE : ERR_WRITE_FAILED);
-        return -1;
-    }
-    if (rename(tmp.c_str(), path.c_str()) != 0) {
-        CORV_LOG_ERR("Failed to rename %s to %s, %m", tmp.c_str(), path.c_str());
-        unlink(tmp.c_str());
-        VLIBCErrSet(ERR_RENAME_FAILED);
-        return -1;
-    }
-    return 0;
+    return corvplat::replaceWhole(path, content, static_cast<mode_t>(mode), nullptr) ? 0 : -1;
 }
 
 StateLock::~StateLock() {

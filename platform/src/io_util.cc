@@ -5,6 +5,7 @@
 #include <stdio.h>
 #include <stdlib.h>
 
+#include "corv/file_replace.h"
 #include "corv/log.h"
 #include "corv/vlibc.h"
 
@@ -127,7 +128,7 @@ bool readWhole(const char* path, size_t limit, std::string& text, bool* missing)
 }
 
 bool replaceWhole(const std::string& target, const std::string& content, mode_t mode,
-                  const struct stat* owner) {
+                  const struct stat* owner, const std::function<bool(const char* written)>& check) {
     // A hidden name that no reader of the directory takes for a document.
     const size_t slash = target.rfind('/');
     std::string tmp = slash == std::string::npos
@@ -164,6 +165,9 @@ bool replaceWhole(const std::string& target, const std::string& content, mode_t 
         VLIBCErrSet(spaceOr(err, ERR_WRITE_FAILED));
         return false;
     }
+    if (check && !check(tmp.c_str())) {
+        return false;
+    }
     if (rename(tmp.c_str(), target.c_str()) != 0) {
         CORV_LOG_ERR("Failed to rename %s to %s, %m", tmp.c_str(), target.c_str());
         VLIBCErrSet(ERR_RENAME_FAILED);
@@ -174,3 +178,8 @@ bool replaceWhole(const std::string& target, const std::string& content, mode_t 
 }
 
 }  // namespace corvplat
+
+bool CORVFileReplace(const std::string& path, const std::string& content, mode_t mode,
+                     const std::function<bool(const char* written)>& check) {
+    return corvplat::replaceWhole(path, content, mode, nullptr, check);
+}

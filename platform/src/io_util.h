@@ -5,6 +5,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <functional>
 #include <string>
 
 namespace corvplat {
@@ -52,6 +53,7 @@ bool readWhole(const char* path, size_t limit, std::string& text, bool* missing 
 // renamed over it, so that a reader sees the old file or the new one and never a part.
 // False with the error slot set (and a log line); the old file is then untouched.
 bool replaceWhole(const std::string& target, const std::string& content, mode_t mode,
-                  const struct stat* owner);
+                  const struct stat* owner,
+                  const std::function<bool(const char* written)>& check = nullptr);
 
 }  // namespace corvplat

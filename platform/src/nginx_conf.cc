@@ -14,6 +14,7 @@
 #include "app_portal.h"
 #include "corv/log.h"
 #include "corv/vlibc.h"
+#include "io_util.h"
 
 namespace corvw3 {
 
@@ -34,23 +35,7 @@ bool ReadFile(const std::string& path, std::string& text, bool& present) {
 }
 
 bool WriteAtomically(const std::string& path, const std::string& text) {
-    std::string tmp = path + ".XXXXXX";
-    const int fd = mkstemp(&tmp[0]);
-    if (fd < 0) {
-        CORV_LOG_ERR("Failed to create tmp file for %s (%m)", path.c_str());
-        VLIBCErrSet(ERR_CREATE_FAILED);
-        return false;
-    }
-    const bool ok = write(fd, text.data(), text.size()) == static_cast<ssize_t>(text.size()) &&
-                    fchmod(fd, 0644) == 0;
-    close(fd);
-    if (!ok || rename(tmp.c_str(), path.c_str()) != 0) {
-        CORV_LOG_ERR("Failed to write %s (%m)", path.c_str());
-        VLIBCErrSet(ERR_WRITE_FAILED);
-        unlink(tmp.c_str());
-        return false;
-    }
-    return true;
+    return corvplat::replaceWhole(path, text, 0644, nullptr);
 }
 
 }  // namespace

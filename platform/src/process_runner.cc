@@ -389,6 +389,10 @@ void ProcessRunner::setTimeout(int seconds) {
     timeout_ = seconds > 0 ? seconds : 0;
 }
 
+void ProcessRunner::setArgZero(const std::string& name) {
+    argZero_ = name;
+}
+
 void ProcessRunner::setWorkingDirectory(const std::string& dir) {
     workdir_ = dir;
 }
@@ -406,7 +410,7 @@ int ProcessRunner::run(int, bool wait, bool capture, int fd) {
 
     std::vector<std::string> argStrings;
     argStrings.reserve(args_.size() + 1);
-    argStrings.push_back(program_);
+    argStrings.push_back(argZero_.empty() ? program_ : argZero_);
     argStrings.insert(argStrings.end(), args_.begin(), args_.end());
     std::vector<std::string> envStrings = childEnvironment(env_);
     std::vector<char*> argv = pointers(argStrings);

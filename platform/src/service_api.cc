@@ -169,6 +169,14 @@ int VLIBServiceIsRunning(const char* name) {
     return VLIBServiceStatusGet(name, &state) == 0 && state == VLIB_SERVICE_STATE_RUNNING ? 1 : 0;
 }
 
+int VLIBServiceIsPaused(const char* name) {
+    CORVInit::JobState state;
+    if (name == nullptr || !CORVInit::ReadJobState(name, &state)) {
+        return -1;
+    }
+    return state.paused ? 1 : 0;
+}
+
 int VLIBServiceIsEnabled(const char* name) {
     if (name == nullptr) {
         return 0;

@@ -1,5 +1,6 @@
 // Volumes are the machine's real mount points named /volume<N>.
 #include "corv/volume.h"
+#include "corv/handles.h"
 
 #include <ctype.h>
 #include <stdio.h>
@@ -43,12 +44,12 @@ struct MountEntry {
 // Mount points as the kernel lists them; the last mount of a path is the visible one.
 std::vector<MountEntry> volumeMounts() {
     std::vector<MountEntry> found;
-    FILE* f = fopen("/proc/self/mounts", "re");
-    if (f == nullptr) {
+    CORVUniqueFile f{fopen("/proc/self/mounts", "re")};
+    if (!f) {
         return found;
     }
     char line[8192];
-    while (fgets(line, sizeof(line), f) != nullptr) {
+    while (fgets(line, sizeof(line), f.get()) != nullptr) {
         char device[4096], mountPoint[4096], type[256], options[2048];
         if (sscanf(line, "%4095s %4095s %255s %2047s", device, mountPoint, type, options) != 4) {
             continue;
@@ -63,7 +64,6 @@ std::vector<MountEntry> volumeMounts() {
                     found.end());
         found.push_back({number, mountPoint, readOnly});
     }
-    fclose(f);
     std::sort(found.begin(), found.end(),
               [](const MountEntry& a, const MountEntry& b) { return a.number < b.number; });
     return found;
@@ -214,4 +214,6 @@ int FSInfoGet(const char* volume, CORVFSINFO** info) {
     return 1;
 }
 
-void FSInfoFree(CORVFSINFO* info) { free(info); }
+void FSInfoFree(CORVFSINFO* info) {
+    free(info);
+}

@@ -1,5 +1,6 @@
 // Ports in use on this machine, and the system web server's own ports.
 #include "corv/web.h"
+#include "corv/handles.h"
 
 #include <dirent.h>
 #include <stdio.h>
@@ -20,14 +21,14 @@ constexpr int kListenState = 0x0A;
 
 // A socket listening on a port of the range, from the kernel's socket tables.
 bool listening(const char* table, int from, int to) {
-    FILE* f = fopen(table, "re");
-    if (f == nullptr) {
+    CORVUniqueFile f{fopen(table, "re")};
+    if (!f) {
         return false;
     }
     char line[512];
     bool found = false;
-    if (fgets(line, sizeof(line), f) != nullptr) {  // the header
-        while (!found && fgets(line, sizeof(line), f) != nullptr) {
+    if (fgets(line, sizeof(line), f.get()) != nullptr) {  // the header
+        while (!found && fgets(line, sizeof(line), f.get()) != nullptr) {
             char local[128];
             char remote[128];
             int state = 0;
@@ -42,19 +43,18 @@ bool listening(const char* table, int from, int to) {
             found = port >= from && port <= to;
         }
     }
-    fclose(f);
     return found;
 }
 
 // A port that an installed package declared, even while the package is stopped.
 bool declaredByPackage(int from, int to) {
-    DIR* dir = opendir("/var/packages");
-    if (dir == nullptr) {
+    CORVUniqueDir dir{opendir("/var/packages")};
+    if (!dir) {
         return false;
     }
     bool found = false;
     while (!found) {
-        struct dirent* entry = readdir(dir);
+        struct dirent* entry = readdir(dir.get());
         if (entry == nullptr) {
             break;
         }
@@ -68,7 +68,6 @@ bool declaredByPackage(int from, int to) {
             found = port >= from && port <= to;
         }
     }
-    closedir(dir);
     return found;
 }
 

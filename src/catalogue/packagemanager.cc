@@ -50,7 +50,7 @@ PackageManager::~PackageManager() {
 }
 
 bool PackageManager::init() {
-    // 1. The machine must know what it is before anything can be installed on it.
+    // The machine must know what it is before anything can be installed on it.
     int arch = PMSGetSystemArch();
     if (arch == 0) {
         CORV_LOG_ERR("Failed to get system arch");
@@ -58,13 +58,12 @@ bool PackageManager::init() {
         return false;
     }
     d->packageInfo.arch = static_cast<unsigned int>(arch);
-    // 2, 3. The registry and the scripts directory.
+    // The registry and the scripts directory.
     if (!ensureDir(kPackagesRegistryDir, "Failed to init packages registry dir") ||
         !ensureDir(kPackagesScriptsDir, "Failed to init packages scripts dir")) {
         setResult(PKG_ERR_SYSTEM);
         return false;
     }
-    // 4.
     return true;
 }
 

@@ -8,6 +8,7 @@
 #include <string>
 
 #include "catalogue/pkginfo_private.h"
+#include "corv/handles.h"
 #include "corv/log.h"
 #include "corvpkg/packagemanager.h"
 #include "corvpkg/pkgfile.h"
@@ -23,18 +24,17 @@ constexpr const char* kRegistry = "/var/packages";
 // Calls `visit` with the name of each sub-directory of `path`, in directory order. A
 // symbolic link is no package. False when the directory cannot be opened.
 bool walkPackageDirs(const char* path, const std::function<void(const char*)>& visit) {
-    DIR* dir = opendir(path);
-    if (dir == nullptr) {
+    CORVUniqueDir dir{opendir(path)};
+    if (!dir) {
         return false;
     }
-    while (struct dirent* entry = readdir(dir)) {
+    while (struct dirent* entry = readdir(dir.get())) {
         if (entry->d_type != DT_DIR || strcmp(entry->d_name, ".") == 0 ||
             strcmp(entry->d_name, "..") == 0) {
             continue;
         }
         visit(entry->d_name);
     }
-    closedir(dir);
     return true;
 }
 
@@ -49,12 +49,11 @@ std::vector<std::string> PackageManager::enumPackages(const std::set<std::string
     std::vector<std::string> names;
     walkPackageDirs(kRegistry, [&](const char* name) {
         const std::string dir = packageDir(kRegistry, name);
-        // 1.
         PackageInfo info;
         if (!PMSLoadPKGInfoFile(dir, info, nullptr, mask)) {
             return;
         }
-        // 2, 3. "/volume1" must not take in "/volume10/...".
+        // "/volume1" must not take in "/volume10/...".
         const std::string target = PMSReadLink(dir + "/target");
         if (target.empty() || volumes.empty()) {
             names.push_back(name);
@@ -106,12 +105,11 @@ void PackageManager::enumPackageInfoMap(std::map<std::string, PackageInfo>& out,
 bool PackageManager::enumPackageInfoByPath(const char* path, std::vector<PackageInfo>& out,
                                            std::vector<std::string>& failed, const char* language,
                                            unsigned long long mask) {
-    // 1.
     if (path == nullptr) {
         setResult(PKG_ERR_ENUMERATION);
         return false;
     }
-    // 2. A directory without INFO is no package and no failure.
+    // A directory without INFO is no package and no failure.
     bool opened = walkPackageDirs(path, [&](const char* name) {
         const std::string dir = packageDir(path, name);
         if (access((dir + "/INFO").c_str(), F_OK) != 0) {
@@ -129,7 +127,6 @@ bool PackageManager::enumPackageInfoByPath(const char* path, std::vector<Package
         setResult(PKG_ERR_ENUMERATION);
         return false;
     }
-    // 3.
     if (failed.empty()) {
         return true;
     }
@@ -146,21 +143,17 @@ bool PackageManager::enumPackageInfo(std::vector<PackageInfo>& out, const char* 
 bool PackageManager::getPackageInfoByPathAndInfoType(const char* dir, PackageInfo& info,
                                                      const char* language,
                                                      unsigned long long mask) {
-    // 1.
     if (dir == nullptr) {
         return false;
     }
-    // 2, 3.
     bool ok = PMSLoadPKGInfoFile(dir, info, language, mask);
     info.script_mask = PMGetScriptMask(std::string(dir) + "/scripts");
-    // 4.
     for (const std::string& candidate : PMSUIFileCandidates(language, PKG_UNINSTALL)) {
         if (access((std::string(dir) + "/" + candidate).c_str(), F_OK) == 0) {
             info.has_uninstall_wizard = true;
             break;
         }
     }
-    // 5.
     return ok;
 }
 

@@ -49,7 +49,6 @@ int extract(const std::string& cpkFile, const std::string& dir, const std::strin
 
 bool PMSExtractPackageInfo(const std::string& dir, const std::string& cpkFile, PackageInfo& info,
                            const char* language) {
-    // 1.
     CORVUtils::ProcessRunner infoRun("/bin/tar");
     if (extract(cpkFile, dir, "INFO", true, &infoRun) != 0) {
         CORV_LOG_ERR("Failed to extract package INFO to %s", dir.c_str());
@@ -62,24 +61,23 @@ bool PMSExtractPackageInfo(const std::string& dir, const std::string& cpkFile, P
         }
         return false;
     }
-    // 2. conf/ is optional.
+    // conf/ is optional.
     extract(cpkFile, dir, "conf", true);
     if (!PMSCheckPackageMembers(dir)) {
         return false;
     }
-    // 3, 4. A bad INFO is judged by the callers, from what was read.
+    // A bad INFO is judged by the callers, from what was read.
     bool loaded = PMSLoadPKGInfoFile(dir, info, language, PKG_INFO_MASK_ALL);
     info.script_mask = 0;
     if (!loaded) {
         return true;
     }
-    // 5.
     for (const PKG_SCRIPT_ENTRY& script : g_PackageScripts) {
         char member[128];
         snprintf(member, sizeof(member), "scripts/%s", script.name);
         extract(cpkFile, dir, member, false);
     }
-    // 6. A script that is a link would have its target made executable here.
+    // A script that is a link would have its target made executable here.
     if (!PMSCheckPackageMembers(dir)) {
         return false;
     }
@@ -107,18 +105,16 @@ bool PackageManager::queryPackageFileInfo(const std::string& cpkFile, PackageInf
 }
 
 bool PackageManager::verifyPackageTgzFile(const std::string& cpkFile, const char* checksum) {
-    // 1.
     if (cpkFile.empty()) {
         CORV_LOG_ERR("Wrong parameters");
         return false;
     }
-    // 2.
     std::string tmp;
     if (!PMSCreateTmpFolder(tmp)) {
         CORV_LOG_ERR("Failed to generate temp filename");
         return false;
     }
-    // 3. The work directory repeats the temporary path under itself. Only that inner
+    // The work directory repeats the temporary path under itself. Only that inner
     // directory, which holds the extracted payload, is removed at the end; the empty
     // outer folder stays.
     const std::string work = tmp + "/" + tmp;
@@ -128,17 +124,14 @@ bool PackageManager::verifyPackageTgzFile(const std::string& cpkFile, const char
         CORV_LOG_ERR("Failed to mkdir tempdir %s", work.c_str());
         return false;
     }
-    // 4.
     if (checksum == nullptr) {
         return true;
     }
-    // 5.
     if (extract(cpkFile, work, "package.tgz", true) != 0) {
         CORV_LOG_ERR("Failed to extract the package.tgz in %s", work.c_str());
         PMSExplainFailedUnpack(*this, work, PMSArchiveBytes(cpkFile, false, "package.tgz"));
         return false;
     }
-    // 6.
     char path[4096];
     snprintf(path, sizeof(path), "%s/package.tgz", work.c_str());
     if (!PMSCompareCheckSum(path, checksum)) {

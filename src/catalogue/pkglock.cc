@@ -43,9 +43,8 @@ void logLockHolders() {
 }  // namespace
 
 bool PackageManager::ExLock(int seconds) {
-    // 1.
     if (VLIBCFileLock(kPkgLockExclusiveWait, seconds) != 0) {
-        // 2. Only the first boot after an OS upgrade goes on without the lock.
+        // Only the first boot after an OS upgrade goes on without the lock.
         int err = errno;
         if (err != EAGAIN) {
             errno = err;
@@ -57,7 +56,7 @@ bool PackageManager::ExLock(int seconds) {
         }
         logLockHolders();
     }
-    // 3, 4. The lock stays held on these refusals: the process is about to be stopped
+    // The lock stays held on these refusals: the process is about to be stopped
     // anyway, and nobody else may start work meanwhile.
     if (!g_skipUpgradeCheck && VLIBCFileExist(kUpgradeStopServiceFlag)) {
         CORV_LOG_ERR("Failed to lock, %s exists", kUpgradeStopServiceFlag);
@@ -67,7 +66,6 @@ bool PackageManager::ExLock(int seconds) {
         CORV_LOG_ERR("Failed to lock, %s exists", kNormalShutdownFlag);
         return false;
     }
-    // 5.
     return true;
 }
 

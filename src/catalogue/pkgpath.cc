@@ -13,6 +13,7 @@
 #include <string>
 
 #include "common/regular_file.h"
+#include "corv/handles.h"
 #include "corv/log.h"
 #include "corv/vlibc.h"
 #include "corv/volume.h"
@@ -41,7 +42,6 @@ bool startsWith(const std::string& text, const char* prefix) {
 
 bool prepareDownloadDir(const char* subdir, const char* volume, unsigned long long size,
                         std::string& dir) {
-    // 1.
     std::string base;
     bool systemDir = false;
     if (!PMSGetTmpDir(size, volume, base)) {
@@ -50,17 +50,15 @@ bool prepareDownloadDir(const char* subdir, const char* volume, unsigned long lo
         }
         systemDir = true;
     }
-    // 2.
     base += "/@corvpkg/@download";
     if (!makeSharedDir(base)) {
         return false;
     }
-    // 3. Nothing else cleans the root file system, so old downloads go here.
+    // Nothing else cleans the root file system, so old downloads go here.
     if (systemDir) {
         VLIBCExec("/usr/bin/find", base.c_str(), "-maxdepth", "1", "-type", "f", "!", "-mtime",
                   "-1", "-exec", "rm", "-rf", "{}", ";", nullptr);
     }
-    // 4.
     std::string path = base + "/" + (subdir ? subdir : "");
     if (!makeSharedDir(path)) {
         return false;
@@ -149,13 +147,12 @@ bool PMSGetSystemInstallPath(std::string& path) {
 }
 
 bool PMSGetTmpDir(unsigned long long size, const char* volume, std::string& dir) {
-    // 1.
     dir.clear();
-    // 2. The caller's volume, when it has more than enough room.
+    // The caller's volume, when it has more than enough room.
     CORVMOUNTVOLINFO info;
     bool chosen = volume != nullptr && CORVMountVolInfoGet(volume, &info) == 0 && info.ready &&
                   info.freeBytes > size;
-    // 3. Otherwise any volume with room and the margin.
+    // Otherwise any volume with room and the margin.
     if (!chosen) {
         int flags = 0;
         int found = VolumeAvailGet(size + PKG_VOLUME_MARGIN, &info, &flags, 0);
@@ -178,13 +175,11 @@ bool PMSGetTmpDir(unsigned long long size, const char* volume, std::string& dir)
             }
         }
     }
-    // 4.
     char tmp[kPathSize] = "";
     if (CORVShareTmpPathGet(info.szMountPath, tmp, sizeof(tmp)) < 0) {
         CORV_LOG_ERR("Fail to get share temp path from [%s]", info.szMountPath);
         return false;
     }
-    // 5.
     if (!makeSharedDir(tmp)) {
         return false;
     }
@@ -197,7 +192,7 @@ bool PMSGetTmpDir(unsigned long long size, std::string& dir) {
 }
 
 bool PMSGetSystemTmpDir(unsigned long long size, std::string& dir) {
-    // 1. /tmp while it has room.
+    // /tmp while it has room.
     struct statfs64 tmpStat {};
     if (statfs64("/tmp", &tmpStat) == 0) {
         unsigned long long avail =
@@ -211,7 +206,7 @@ bool PMSGetSystemTmpDir(unsigned long long size, std::string& dir) {
             VLIBCErrSet(PKG_VOLERR_NO_SPACE);
         }
     }
-    // 2. The root file system, keeping a wide margin so the system itself still runs.
+    // The root file system, keeping a wide margin so the system itself still runs.
     struct statvfs64 rootStat {};
     if (statvfs64("/", &rootStat) != 0) {
         return false;
@@ -230,7 +225,6 @@ bool PMSGetSystemTmpDir(unsigned long long size, std::string& dir) {
 }
 
 bool PMSGetListTmpDir(std::string& dir) {
-    // 1.
     std::string previous;
     bool previousValid = false;
     struct stat st {};
@@ -239,17 +233,15 @@ bool PMSGetListTmpDir(std::string& dir) {
         previous = PMSReadLink(PKG_LIST_TMP_LINK);
         previousValid = true;
     }
-    // 2, 3.
     std::string base;
     if (!PMSGetTmpDir(PKG_VOLUME_MARGIN, base) && !PMSGetSystemTmpDir(PKG_VOLUME_MARGIN, base)) {
         return false;
     }
     dir = base + "/pkglist.tmp/";
-    // 4.
     if (previous == dir) {
         return true;
     }
-    // 5. In this order, so that the link dangles only between unlink and symlink.
+    // In this order, so that the link dangles only between unlink and symlink.
     if (previousValid && !previous.empty()) {
         VLIBCExec("/bin/rm", "-rf", previous.c_str(), nullptr);
     }
@@ -351,12 +343,10 @@ bool PMReadFile(const char* path, unsigned int limit, std::string& content,
 
 bool PMSGetImageTmpPath(const char* category, const char* packageName, const char* version,
                         std::string& path) {
-    // 1.
     if (category == nullptr || category[0] == '\0' || packageName == nullptr ||
         packageName[0] == '\0') {
         return false;
     }
-    // 2.
     std::string root;
     if (!PMSGetListTmpDir(root)) {
         root = kImageCacheFallback;
@@ -367,7 +357,6 @@ bool PMSGetImageTmpPath(const char* category, const char* packageName, const cha
         }
         return false;
     }
-    // 3.
     const std::string packageDir = root + "icon/" + category + "/" + packageName;
     const std::string cacheDir = packageDir + "/" + (version ? version : "");
     if (CORVFSMkdirP(cacheDir.c_str(), nullptr, 1, -1, -1, 0777) < 0) {
@@ -376,9 +365,9 @@ bool PMSGetImageTmpPath(const char* category, const char* packageName, const cha
         }
         return false;
     }
-    // 4. Other versions of the same package are stale.
-    if (DIR* d = opendir(packageDir.c_str())) {
-        while (struct dirent* entry = readdir(d)) {
+    // Other versions of the same package are stale.
+    if (CORVUniqueDir d{opendir(packageDir.c_str())}) {
+        while (struct dirent* entry = readdir(d.get())) {
             const char* name = entry->d_name;
             if (strcmp(name, ".") == 0 || strcmp(name, "..") == 0 || CORVEAIsHiddenDir(name)) {
                 continue;
@@ -397,7 +386,6 @@ bool PMSGetImageTmpPath(const char* category, const char* packageName, const cha
                 break;
             }
         }
-        closedir(d);
     }
     path = cacheDir;
     return true;

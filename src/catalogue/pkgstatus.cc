@@ -108,31 +108,26 @@ bool PMSCheckPackage(const std::string& name) {
 }
 
 bool PackageManager::getServiceStatus(const std::string& name, bool& running, bool askScript) {
-    // 1.
     setResult(PKG_ERR_SYSTEM);
     running = false;
-    // 2.
     PackageInfo info;
     const std::string script = getServiceScript(name, info);
     if (script.empty()) {
         return false;
     }
-    // 3.
     if (!PMSCheckPackageArchModelMatched(info)) {
         setResult(PKG_ERR_ARCH_MISMATCH);
         return false;
     }
-    // 4.
     if (!CanPackageStartInThisFirmware(info)) {
         return false;
     }
-    // 5. An interrupted install wins over whatever the script would say.
+    // An interrupted install wins over whatever the script would say.
     if (access((kRegistry + name + "/installing").c_str(), F_OK) == 0) {
         setResult(PKG_ERR_BROKEN);
         CORV_LOG_ERR("Package is broken: incomplete installation, %s", name.c_str());
         return false;
     }
-    // 6, 7.
     if (askScript) {
         CORVUtils::ProcessRunner runner(script, {"status"});
         runner.setTimeout(kScriptTimeoutSeconds);
@@ -158,7 +153,6 @@ bool PackageManager::getServiceStatus(const std::string& name, bool& running, bo
     } else {
         running = true;
     }
-    // 8.
     if (info.startable) {
         if (!info.nosuidir.empty() && access((kThirdPartyUI + name).c_str(), F_OK) != 0) {
             running = false;
@@ -167,7 +161,6 @@ bool PackageManager::getServiceStatus(const std::string& name, bool& running, bo
             running = false;
         }
     }
-    // 9.
     const std::string job = "pkgctl-" + name;
     int state = 0;
     if (VLIBServiceStatusGet(job.c_str(), &state) < 0) {
@@ -253,13 +246,11 @@ bool PackageManager::isStarted(const std::string& name) {
 }
 
 std::string PackageManager::getPackageLog(const std::string& name, bool quiet) {
-    // 1.
     PackageInfo info;
     const std::string script = getServiceScript(name, info);
     if (script.empty()) {
         return "";
     }
-    // 2.
     CORVUtils::ProcessRunner runner(script, {"log"});
     runner.setTimeout(kScriptTimeoutSeconds);
     PMSPrepareScriptEnv(info, runner, nullptr, nullptr, static_cast<PKG_INSTALLATION_TYPE>(0),
@@ -270,7 +261,6 @@ std::string PackageManager::getPackageLog(const std::string& name, bool quiet) {
         setResult(PKG_ERR_BAD_ARCHIVE);
         return "";
     }
-    // 3.
     std::string text;
     if (runner.run(true, true) == 0) {
         text = runner.getCapturedOutput();
@@ -282,7 +272,6 @@ std::string PackageManager::getPackageLog(const std::string& name, bool quiet) {
         setResult(PKG_ERR_SYSTEM);
         return "";
     }
-    // 4.
     setResult(PKG_OK);
     return text;
 }

@@ -124,27 +124,27 @@ std::vector<std::string> PMSExplodeString(const std::string& text, const std::st
 
 bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* language,
                         unsigned long long mask) {
-    // 1. Paths, and a fresh record.
+    // Paths, and a fresh record.
     const std::string infoPath = dir + "/INFO";
     const std::string depsPath = dir + "/conf/PKG_DEPS";
     const std::string conxPath = dir + "/conf/PKG_CONX";
     info = PackageInfo();
     PackageInfoExtraPrivate* extra = info.extra.priv();
 
-    // 2. Not a package directory: quietly no. An INFO that is no regular file (a named
+    // Not a package directory: quietly no. An INFO that is no regular file (a named
     // pipe would stall the read) is no INFO.
     if (!VLIBCFileCheckDir(dir.c_str()) || !PMSIsRegularFile(infoPath)) {
         return false;
     }
 
-    // 3. The keys to fetch and the values fetched.
+    // The keys to fetch and the values fetched.
     InfoKeys keys;
     if (!keys.ok()) {
         CORV_LOG_ERR("Out of memory!!");
         return false;
     }
 
-    // 4. Every key that is always read or that the mask selects.
+    // Every key that is always read or that the mask selects.
     for (const auto& [number, key] : g_MappingPKGInfoFields) {
         auto optional = g_MappingPKGInfoAdditional.find(number);
         if (optional == g_MappingPKGInfoAdditional.end() || (mask & optional->second) != 0) {
@@ -152,7 +152,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 5. Language variants, only when texts for display are wanted.
+    // Language variants, only when texts for display are wanted.
     std::string lang;
     if ((mask & (INFO_MASK_DESCRIPTION | INFO_MASK_DISPLAYNAME)) != 0) {
         lang = readLanguage(language);
@@ -173,14 +173,14 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 6. One read of the file.
+    // One read of the file.
     if (keys.load(infoPath.c_str()) < 0) {
         CORV_LOG_ERR("VLIBCFileGetKeys() failed!! szFile=[%s], corverr=[0x%04X]", infoPath.c_str(),
                      VLIBCErrGet());
         return false;
     }
 
-    // 7. The name.
+    // The name.
     const char* value = keys.get(PKG_INFO_PACKAGE);
     if (value == nullptr) {
         CORV_LOG_ERR("key [%s] not found in %s corverr=[0x%04X]", "package", infoPath.c_str(),
@@ -193,7 +193,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
     }
     info.package = value;
 
-    // 8. The version.
+    // The version.
     value = keys.get(PKG_INFO_VERSION);
     if (isEmpty(value)) {
         CORV_LOG_ERR("key [%s] not found", "version");
@@ -201,7 +201,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
     }
     info.version = value;
 
-    // 9. Maintainer and distributor.
+    // Maintainer and distributor.
     if (mask & INFO_MASK_MAINTAINER) {
         value = keys.get(PKG_INFO_MAINTAINER);
         if (isEmpty(value)) {
@@ -223,7 +223,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         info.distributor_url = value ? value : "";
     }
 
-    // 10. The description.
+    // The description.
     if (mask & INFO_MASK_DESCRIPTION) {
         value = keys.get(PKG_INFO_DESCRIPTION);
         if (isEmpty(value)) {
@@ -237,7 +237,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 11. The web entry of the package. The port check lets 65536 through on purpose.
+    // The web entry of the package. The port check lets 65536 through on purpose.
     if (mask & INFO_MASK_ADMIN) {
         value = keys.get(PKG_INFO_ADMINURL);
         if (value != nullptr) {
@@ -260,7 +260,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 12. Architectures and models.
+    // Architectures and models.
     value = keys.get(PKG_INFO_ARCH);
     if (isEmpty(value)) {
         info.arch = 0xFFFFFFFF;
@@ -276,7 +276,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         info.model_list = PMSExplodeString(value, " \t");
     }
 
-    // 13. OS versions: "os_min_ver" is the newer name of "firmware" and wins over it.
+    // OS versions: "os_min_ver" is the newer name of "firmware" and wins over it.
     value = keys.get(PKG_INFO_OS_MIN_VER);
     if (value == nullptr) {
         value = keys.get(PKG_INFO_FIRMWARE);
@@ -290,7 +290,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         PMSParseOSVersion(value, extra->os_max_ver);
     }
 
-    // 14. Texts in the wanted language.
+    // Texts in the wanted language.
     if (mask & INFO_MASK_DISPLAYNAME) {
         value = keys.get(PKG_INFO_DISPLAYNAME);
         info.displayname = value ? value : "";
@@ -308,7 +308,6 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 15.
     if (isNo(keys.get(PKG_INFO_CHECKPORT))) {
         info.checkport = false;
     }
@@ -319,7 +318,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 16. Daemons to restart and services required.
+    // Daemons to restart and services required.
     if (mask & INFO_MASK_RESTART_SERVICES) {
         info.instuninst_restart_services = static_cast<unsigned int>(
             PMSConvMapRestartService(keys.get(PKG_INFO_INSTUNINST_RESTART_SERVICES)));
@@ -337,7 +336,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         extra->start_dep_service_set = PackageManager::getServiceSetFromString(value);
     }
 
-    // 17. The UI directory name ends up in paths, so it obeys the name rule too.
+    // The UI directory name ends up in paths, so it obeys the name rule too.
     value = keys.get(PKG_INFO_NOSUIDIR);
     if (!isEmpty(value)) {
         if (!PMSIsLegalName(value, kUIDirNameForbidden)) {
@@ -353,7 +352,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 18. "ctl_stop" is the newer name of "startable" and alone decides when present.
+    // "ctl_stop" is the newer name of "startable" and alone decides when present.
     if ((mask & INFO_MASK_INSTALL_REBOOT) && isYes(keys.get(PKG_INFO_INSTALL_REBOOT))) {
         info.install_reboot = true;
     }
@@ -367,7 +366,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 19. Dependencies and conflicts: the section file, when there is one, replaces the
+    // Dependencies and conflicts: the section file, when there is one, replaces the
     // INFO key entirely.
     if (mask & INFO_MASK_DEP_PACKAGES) {
         if (VLIBCFileExist(depsPath.c_str())) {
@@ -384,7 +383,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         }
     }
 
-    // 20. The rest cannot fail.
+    // The rest cannot fail.
     if ((mask & INFO_MASK_SILENT_INSTALL) && isYes(keys.get(PKG_INFO_SILENT_INSTALL))) {
         info.silent_install = true;
     }
@@ -447,7 +446,7 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         extra->ctl_uninstall = false;
     }
 
-    // 21. The list and hash go with `keys`.
+    // The list and hash go with `keys`.
     return true;
 }
 

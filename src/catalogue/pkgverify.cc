@@ -30,7 +30,7 @@ std::string PMSOSVersionText(const int v[3]) {
 }
 
 bool PMSCheckPackagePortConflict(const PackageInfo& info) {
-    // 1. An upgrade keeps its own port.
+    // An upgrade keeps its own port.
     bool upgrade = false;
     PackageInfo old;
     if (PMSCheckPackage(info.package)) {
@@ -41,11 +41,10 @@ bool PMSCheckPackagePortConflict(const PackageInfo& info) {
         }
         upgrade = true;
     }
-    // 2.
     if (!info.checkport || info.adminport <= 0 || info.adminprotocol.empty()) {
         return false;
     }
-    // 3, 4. The system web server serves its own ports and the standard ones.
+    // The system web server serves its own ports and the standard ones.
     corvw3::Engine engine;
     corvw3::NOS nos(&engine);
     for (const std::string& protocol : info.adminprotocol) {
@@ -63,7 +62,6 @@ bool PMSCheckPackagePortConflict(const PackageInfo& info) {
             return true;
         }
     }
-    // 5.
     return false;
 }
 
@@ -92,7 +90,6 @@ bool PackageManager::canPackageRunAfterInstall(const PackageInfo& info) {
 }
 
 bool PackageManager::checkPkgInfoCanInstallEx(PackageInfo& info, const char* language) {
-    // 1.
     switch (PMSComparePackageAndOSVersion(info)) {
         case 1:
             setResult(PKG_ERR_OS_TOO_NEW, Json::Value(PMSOSVersionText(PMSGetOSMaxVer(info))));
@@ -103,16 +100,13 @@ bool PackageManager::checkPkgInfoCanInstallEx(PackageInfo& info, const char* lan
         default:
             break;
     }
-    // 2.
     if (!CanPackageStartInThisFirmware(info)) {
         return false;
     }
-    // 3.
     if (PMSCheckPackagePortConflict(info)) {
         setResult(PKG_ERR_PORT_CONFLICT, Json::Value(std::to_string(info.adminport)));
         return false;
     }
-    // 4.
     std::string names;
     if (arePackagesConflict(PackageBasicInfo(info.package, info.version), info.conflict_packages,
                             names, language) &&
@@ -120,7 +114,7 @@ bool PackageManager::checkPkgInfoCanInstallEx(PackageInfo& info, const char* lan
         setResult(PKG_ERR_CONFLICT_PACKAGES, Json::Value(names));
         return false;
     }
-    // 5. PostgreSQL needs a volume for its data.
+    // PostgreSQL needs a volume for its data.
     unsigned int off = checkServiceStarted(info.install_dep_services);
     if (off != 0) {
         if ((off & kPgsqlBit) && VolumeCountGet(kPgsqlVolumeKinds) == 0) {
@@ -130,12 +124,10 @@ bool PackageManager::checkPkgInfoCanInstallEx(PackageInfo& info, const char* lan
         }
         return false;
     }
-    // 6.
     if (compareWithInstallPkgInfo(info) == 2) {
         setResult(PKG_ERR_DOWNGRADE);
         return false;
     }
-    // 7.
     return true;
 }
 

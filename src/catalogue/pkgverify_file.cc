@@ -35,23 +35,20 @@ PKG_ERRCODE volumeError(int platformError) {
 bool checkFile(const char* language, const char* cpkFile, PKG_ERRCODE& code, Json::Value& data,
                PackageInfo& info) {
     PackageManager pm;
-    // 1.
     if (language == nullptr) {
         code = PKG_ERR_SYSTEM;
         return false;
     }
-    // 2. A record that the caller filled is taken as it is.
+    // A record that the caller filled is taken as it is.
     if (info.package.empty() &&
         !pm.queryPackageFileInfo(cpkFile, info, static_cast<PKG_INSTALLATION_TYPE>(0), language)) {
         code = PKG_ERR_BROKEN;
         return false;
     }
-    // 3.
     if (!pm.CheckVolume(cpkFile, info)) {
         code = volumeError(VLIBCErrGet());
         return false;
     }
-    // 4.
     if (!info.checksum.empty() && !pm.verifyPackageTgzFile(cpkFile, info.checksum.c_str())) {
         code = PKG_ERR_BAD_ARCHIVE;
         // A payload that did not fit is no damage: say so beside the fixed report.
@@ -61,7 +58,6 @@ bool checkFile(const char* language, const char* cpkFile, PKG_ERRCODE& code, Jso
         }
         return false;
     }
-    // 5.
     switch (PMSComparePackageAndOSVersion(info)) {
         case 1:
             code = PKG_ERR_OS_TOO_NEW;
@@ -72,7 +68,6 @@ bool checkFile(const char* language, const char* cpkFile, PKG_ERRCODE& code, Jso
         default:
             break;
     }
-    // 6.
     std::string names;
     if (pm.arePackagesConflict(PackageBasicInfo(info.package, info.version), info.conflict_packages,
                                names, language) &&
@@ -81,7 +76,6 @@ bool checkFile(const char* language, const char* cpkFile, PKG_ERRCODE& code, Jso
         code = PKG_ERR_CONFLICT_PACKAGES;
         return false;
     }
-    // 7.
     std::set<std::string> off = pm.checkServiceStarted(PMSGetInstallDepServiceSet(info));
     if (!off.empty()) {
         if (off.count("pgsql") && VolumeCountGet(kPgsqlVolumeKinds) == 0) {
@@ -103,7 +97,6 @@ bool checkFile(const char* language, const char* cpkFile, PKG_ERRCODE& code, Jso
         code = PKG_ERR_SERVICE_NOT_STARTED;
         return false;
     }
-    // 8.
     Json::Value missing;
     std::string notStarted;
     if (!pm.arePackagesInstallAndStart(info.dep_packages, missing, notStarted, language)) {
@@ -112,22 +105,19 @@ bool checkFile(const char* language, const char* cpkFile, PKG_ERRCODE& code, Jso
         code = PKG_ERR_DEPENDENCY;
         return false;
     }
-    // 9.
     if (!PMSCheckPackageArchModelMatched(info)) {
         code = PKG_ERR_PLATFORM;
         return false;
     }
-    // 10.
     if (PMSCheckPackagePortConflict(info)) {
         code = PKG_ERR_PORT_CONFLICT;
         return false;
     }
-    // 11. A package without upgrade scripts cannot replace an installed copy of itself.
+    // A package without upgrade scripts cannot replace an installed copy of itself.
     if (PMSCheckPackage(info.package) && (info.script_mask & (0x20 | 0x40)) == 0) {
         code = PKG_ERR_UPGRADE_FAILED;
         return false;
     }
-    // 12.
     PKG_ERRCODE signature = PackageManager::verifyPackageSignature(cpkFile);
     if (signature == PKG_SIGNATURE_OK) {
         return true;

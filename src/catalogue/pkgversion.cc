@@ -90,7 +90,6 @@ int compareNormal(const std::string& otherNorm, const std::string& thisNorm) {
 }  // namespace
 
 bool NormalizeVersion(const char* version, const char* reference, char** buffer, int* capacity) {
-    // 1.
     SzList versionPieces(kPieceCapacity);
     SzList referencePieces(kPieceCapacity);
     if (!versionPieces || !referencePieces) {
@@ -104,7 +103,6 @@ bool NormalizeVersion(const char* version, const char* reference, char** buffer,
                      VLIBCErrorGetLine());
         return false;
     }
-    // 2.
     const char* firstVersion = VLIBCSzListGet(versionPieces.get(), 0);
     const char* firstReference = VLIBCSzListGet(referencePieces.get(), 0);
     if (firstVersion == nullptr || firstReference == nullptr) {
@@ -112,7 +110,7 @@ bool NormalizeVersion(const char* version, const char* reference, char** buffer,
                      VLIBCErrorGetFile(), VLIBCErrorGetLine());
         return false;
     }
-    // 3, 4, 5. The version only ever grows to the reference's shape.
+    // The version only ever grows to the reference's shape.
     size_t have = dots(firstVersion);
     size_t want = dots(firstReference);
     if (VLIBCStrCat(buffer, capacity, firstVersion) < 0) {
@@ -123,7 +121,6 @@ bool NormalizeVersion(const char* version, const char* reference, char** buffer,
             return false;
         }
     }
-    // 6.
     const char* build = VLIBCSzListGet(versionPieces.get(), 1);
     if (build != nullptr &&
         (VLIBCStrCat(buffer, capacity, "-") < 0 || VLIBCStrCat(buffer, capacity, build) < 0)) {
@@ -148,11 +145,9 @@ bool NormalizeVersion(std::string version, std::string reference, std::string& n
 }
 
 bool PackageBasicInfo::compare(const PackageBasicInfo& other, PKG_VERSION_COMPOP op) const {
-    // 1.
     if (package != other.package) {
         return false;
     }
-    // 2.
     std::string normOther;
     std::string normThis;
     if (!NormalizeVersion(other.version, version, normOther) ||
@@ -160,11 +155,9 @@ bool PackageBasicInfo::compare(const PackageBasicInfo& other, PKG_VERSION_COMPOP
         CORV_LOG_ERR("Failed to NormalizeVersion");
         return false;
     }
-    // 3.
     if (op == PKG_COMPOP_NONE) {
         return true;
     }
-    // 4, 5.
     int r = compareNormal(normOther, normThis);
     switch (op) {
         case PKG_COMPOP_EQ:

@@ -188,16 +188,14 @@ bool PMSSavePackageDefVolPath(const char* path) {
 
 bool PackageManager::GetAppStoreVolume(const PackageInfo& info, const char* volume,
                                        unsigned long long size, std::string& out) {
-    // 1.
     if (volume == nullptr || volume[0] == '\0') {
         return false;
     }
-    // 2. A small box has its one volume.
+    // A small box has its one volume.
     if (VLIBCIsDockette()) {
         out = "/volume1";
         return PMSCheckFreeSpace("/volume1", size + PKG_VOLUME_MARGIN);
     }
-    // 3.
     if (info.install_type == "system") {
         std::string path;
         if (!PMSGetSystemInstallPath(path)) {
@@ -210,7 +208,6 @@ bool PackageManager::GetAppStoreVolume(const PackageInfo& info, const char* volu
         out = path;
         return true;
     }
-    // 4.
     char parsed[4096] = "";
     if (VolumePathParseEx(volume, parsed) < 0) {
         CORV_LOG_ERR("Failed to parse volume path: %s", volume);
@@ -224,7 +221,6 @@ bool PackageManager::GetAppStoreVolume(const PackageInfo& info, const char* volu
 }
 
 bool PackageManager::CheckVolume(const char* cpkFile, const PackageInfo& info) {
-    // 1.
     if (cpkFile == nullptr) {
         return false;
     }
@@ -233,7 +229,6 @@ bool PackageManager::CheckVolume(const char* cpkFile, const PackageInfo& info) {
         CORV_LOG_ERR("Failed to get status of %s, %m", cpkFile);
         return false;
     }
-    // 2.
     const unsigned long long need = static_cast<unsigned long long>(st.st_size) + PKG_VOLUME_MARGIN;
     const bool dockette = VLIBCIsDockette();
     if (dockette) {
@@ -245,7 +240,7 @@ bool PackageManager::CheckVolume(const char* cpkFile, const PackageInfo& info) {
             return false;
         }
     }
-    // 3. Packages that live on a data volume need one.
+    // Packages that live on a data volume need one.
     if (info.install_type != "system" && info.install_type != "cluster") {
         if (VolumeCountGet(dockette ? (CORV_VOL_KIND_USB | CORV_VOL_KIND_ESATA)
                                     : CORV_VOL_KIND_INTERNAL) == 0) {
@@ -253,7 +248,6 @@ bool PackageManager::CheckVolume(const char* cpkFile, const PackageInfo& info) {
             return false;
         }
     }
-    // 4.
     return true;
 }
 

@@ -100,14 +100,13 @@ bool PMSExtractUIFile(const char* cpkFile, const char* dir, const std::string& m
 
 bool PMSRunUIScript(const PackageInfo& info, const char* cpkFile, const std::string& script,
                     const char* language, PKG_INSTALLATION_TYPE type, Json::Value& wizard) {
-    // 1. The result file goes on every way out (5).
+    // The result file goes on every way out (5).
     CORVUtils::ProcessRunner runner(script);
     TempFile result;
     if (!PMSCreateTmpFile(result.path())) {
         return false;
     }
     const std::string& resultFile = result.path();
-    // 2.
     switch (type) {
         case PKG_INSTALL:
             PMSPrepareScriptEnv(info, runner, language, &resultFile, PKG_INSTALL, nullptr, nullptr,
@@ -134,24 +133,23 @@ bool PMSRunUIScript(const PackageInfo& info, const char* cpkFile, const std::str
         default:
             return false;
     }
-    // 3. The script's own output is not the wizard; it is captured and dropped.
+    // The script's own output is not the wizard; it is captured and dropped.
     if (runner.run(true, true) != 0) {
         CORV_LOG_ERR("Failed to run %s for %s", script.c_str(), info.package.c_str());
         return false;
     }
-    // 4. A script that ran has done its part; what it wrote is judged by the caller.
+    // A script that ran has done its part; what it wrote is judged by the caller.
     PMReadUIFileContent(resultFile, wizard);
     return true;
 }
 
 bool PMReadUIFileContent(const std::string& path, Json::Value& wizard) {
-    // 1.
     std::string text;
     if (!PMSReadRegularFile(path, text)) {
         CORV_LOG_ERR("Fail to read %s", path.c_str());
         return false;
     }
-    // 2. Parsed aside: a half-read document must not pass for steps and stop the search
+    // Parsed aside: a half-read document must not pass for steps and stop the search
     // for the next wizard file.
     Json::Reader reader;
     Json::Value parsed;
@@ -160,19 +158,16 @@ bool PMReadUIFileContent(const std::string& path, Json::Value& wizard) {
         return false;
     }
     wizard = parsed;
-    // 3.
     if (!wizard.isArray()) {
         CORV_LOG_ERR("Fail to parse %s", path.c_str());
         return false;
     }
-    // 4.
     for (const Json::Value& step : wizard) {
         if (!step.isObject() || !step["items"].isArray()) {
             CORV_LOG_ERR("Fail to parse %s in [items]", path.c_str());
             return false;
         }
     }
-    // 5.
     return true;
 }
 
@@ -237,7 +232,7 @@ bool PackageManager::parseUIFile(const std::string& cpkFile, const std::string& 
 bool PackageManager::queryPackageFileInfoWithWizard(const std::string& cpkFile, PackageInfo& info,
                                                     PKG_INSTALLATION_TYPE type,
                                                     const char* language) {
-    // 1. The folder goes on every way out (6).
+    // The folder goes on every way out (6).
     if (cpkFile.empty()) {
         CORV_LOG_ERR("Wrong parameters");
         return false;
@@ -248,12 +243,11 @@ bool PackageManager::queryPackageFileInfoWithWizard(const std::string& cpkFile, 
         return false;
     }
     TempFolder cleanup(tmp);
-    // 2.
     if (!PMSExtractPackageInfo(tmp, cpkFile, info, language)) {
         CORV_LOG_ERR("Failed to query info");
         return false;
     }
-    // 3. A package need not have a licence; a longer one is cut, not refused.
+    // A package need not have a licence; a longer one is cut, not refused.
     const std::string license = tmp + "/LICENSE";
     if (extractMember(cpkFile, tmp, "LICENSE") == 0 && !PMSCheckPackageMembers(tmp)) {
         return false;
@@ -263,11 +257,9 @@ bool PackageManager::queryPackageFileInfoWithWizard(const std::string& cpkFile, 
         CORV_LOG_ERR("Failed to read license file LICENSE in %s", cpkFile.c_str());
         return false;
     }
-    // 4.
     if (type == 0) {
         type = PMSCheckPackage(info.package) ? PKG_UPGRADE : PKG_INSTALL;
     }
-    // 5.
     return parseUIFile(cpkFile, tmp, type, info, language);
 }
 

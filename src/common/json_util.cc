@@ -10,6 +10,7 @@
 #include <sstream>
 
 #include "common/regular_file.h"
+#include "corv/file_replace.h"
 
 namespace CORVPackageTool {
 
@@ -33,35 +34,9 @@ bool fromString(const std::string& text, Json::Value& value) {
     return true;
 }
 
+// Readers of these files are other users' processes too.
 bool toFile(const Json::Value& value, const std::string& path) {
-    std::string tmp = path + ".XXXXXX";
-    int fd = mkstemp(&tmp[0]);
-    if (fd < 0) {
-        return false;
-    }
-    std::string text = toString(value);
-    size_t done = 0;
-    bool ok = true;
-    while (done < text.size()) {
-        ssize_t n = write(fd, text.data() + done, text.size() - done);
-        if (n < 0) {
-            ok = false;
-            break;
-        }
-        done += static_cast<size_t>(n);
-    }
-    // mkstemp creates 0600; these files are read by other users' processes too.
-    if (ok && fchmod(fd, 0644) != 0) {
-        ok = false;
-    }
-    if (close(fd) != 0) {
-        ok = false;
-    }
-    if (!ok || rename(tmp.c_str(), path.c_str()) != 0) {
-        unlink(tmp.c_str());
-        return false;
-    }
-    return true;
+    return CORVFileReplace(path, toString(value), 0644);
 }
 
 bool fromFile(const std::string& path, Json::Value& value) {

@@ -59,14 +59,13 @@ bool joinJsonArray(const Json::Value& array, const std::string& separator, std::
 
 bool PackageManager::arePackagesConflict(PackageBasicInfo pkg, const DepPkgVector& conflicts,
                                          std::string& names, const char* language) {
-    // 1.
     names.clear();
     std::map<std::string, PackageInfo> installed;
     enumPackageInfoMap(installed, language, kConflictMask);
     Json::Value found(Json::arrayValue);
     std::set<std::string> seen;
     bool conflict = false;
-    // 2. What the candidate refuses.
+    // What the candidate refuses.
     for (const PackageBasicInfo& entry : conflicts) {
         auto it = installed.find(entry.package);
         if (it == installed.end() || seen.count(it->first)) {
@@ -79,7 +78,7 @@ bool PackageManager::arePackagesConflict(PackageBasicInfo pkg, const DepPkgVecto
             conflict = true;
         }
     }
-    // 3. What refuses the candidate; an older version of the candidate itself never does.
+    // What refuses the candidate; an older version of the candidate itself never does.
     for (const auto& [name, info] : installed) {
         if (name == pkg.package) {
             continue;
@@ -93,23 +92,19 @@ bool PackageManager::arePackagesConflict(PackageBasicInfo pkg, const DepPkgVecto
             }
         }
     }
-    // 4.
     joinJsonArray(found, ", ", names);
     return conflict;
 }
 
 bool PackageManager::arePackagesInstallAndStart(const DepPkgVector& deps, Json::Value& missing,
                                                 std::string& notStarted, const char* language) {
-    // 1.
     if (deps.empty()) {
         return true;
     }
-    // 2.
     PackageBasicInfoMap installed = enumPackageMap(PKG_INFO_MASK_ALL);
     notStarted.clear();
     missing = Json::Value(Json::objectValue);
     bool ok = true;
-    // 3.
     for (const PackageBasicInfo& entry : deps) {
         auto it = installed.find(entry.package);
         if (it != installed.end() && it->second.compare(entry, entry.compop)) {
@@ -138,7 +133,6 @@ bool PackageManager::arePackagesInstallAndStart(const DepPkgVector& deps, Json::
             missing[entry.package] = "";
         }
     }
-    // 4.
     return ok;
 }
 
@@ -220,19 +214,17 @@ bool PackageManager::getDepPkgListStop(std::string name, const char* language, J
 
 bool PackageManager::topologicalSortPkgs(std::vector<PackageInfo>* pkgs,
                                          std::vector<std::string>& order) {
-    // 1.
     std::vector<PackageInfo> installed;
     if (pkgs == nullptr) {
         enumPackageInfo(installed, nullptr, kDepMask);
         pkgs = &installed;
     }
-    // 2, 3. A later record of the same name takes the name's edges.
+    // A later record of the same name takes the name's edges.
     Graph graph(pkgs->size());
     std::map<std::string, unsigned long long> vertex;
     for (const PackageInfo& info : *pkgs) {
         vertex[info.package] = graph.addVertex(info.package);
     }
-    // 4.
     for (size_t i = 0; i < pkgs->size(); ++i) {
         for (const PackageBasicInfo& dep : (*pkgs)[i].dep_packages) {
             auto it = vertex.find(dep.package);
@@ -241,7 +233,6 @@ bool PackageManager::topologicalSortPkgs(std::vector<PackageInfo>* pkgs,
             }
         }
     }
-    // 5.
     if (!graph.topologicalSort()) {
         std::string all;
         for (const PackageInfo& info : *pkgs) {
@@ -250,7 +241,6 @@ bool PackageManager::topologicalSortPkgs(std::vector<PackageInfo>* pkgs,
         CORV_LOG_ERR("Cycle in %s", all.c_str());
         return false;
     }
-    // 6.
     order = graph.getResult();
     return true;
 }
@@ -269,20 +259,18 @@ bool PackageManager::hasCycle(const PackageInfo& candidate) {
 
 bool PackageManager::getDependencyOrder(const char* name, std::vector<std::string>& order,
                                         bool useEnabledFlag) {
-    // 1, 2.
     if (name == nullptr) {
         return false;
     }
     if (!PMSCheckPackage(name)) {
         return true;
     }
-    // 3.
     std::vector<PackageInfo> all;
     enumPackageInfo(all, nullptr, kDepMask);
     if (all.empty()) {
         return true;
     }
-    // 4. Only active dependents matter: a stopped one need not be stopped again.
+    // Only active dependents matter: a stopped one need not be stopped again.
     Graph graph(all.size());
     std::map<std::string, unsigned long long> vertex;
     bool met = false;
@@ -302,11 +290,10 @@ bool PackageManager::getDependencyOrder(const char* name, std::vector<std::strin
             met = met || isNamed;
         }
     }
-    // 5.
     if (!met) {
         return true;
     }
-    // 6. From the dependency to the dependent.
+    // From the dependency to the dependent.
     for (const PackageInfo& info : all) {
         auto self = vertex.find(info.package);
         if (self == vertex.end()) {
@@ -319,9 +306,7 @@ bool PackageManager::getDependencyOrder(const char* name, std::vector<std::strin
             }
         }
     }
-    // 7.
     graph.visit(vertex[name]);
-    // 8.
     std::vector<PackageInfo> reached;
     for (const std::string& pkg : graph.getResult()) {
         PackageInfo info;
@@ -329,7 +314,6 @@ bool PackageManager::getDependencyOrder(const char* name, std::vector<std::strin
             reached.push_back(info);
         }
     }
-    // 9.
     bool ok = topologicalSortPkgs(&reached, order);
     if (order.empty()) {
         order.push_back(name);
@@ -339,14 +323,12 @@ bool PackageManager::getDependencyOrder(const char* name, std::vector<std::strin
 
 bool PackageManager::getAncestryDependencyOrder(const char* name, std::vector<PackageInfo>& pkgs,
                                                 std::vector<std::string>& order) {
-    // 1.
     if (name == nullptr) {
         return false;
     }
     if (pkgs.empty()) {
         return true;
     }
-    // 2.
     Graph graph(pkgs.size());
     std::map<std::string, unsigned long long> vertex;
     std::map<std::string, PackageInfo> records;
@@ -357,7 +339,6 @@ bool PackageManager::getAncestryDependencyOrder(const char* name, std::vector<Pa
     if (vertex.find(name) == vertex.end()) {
         return true;
     }
-    // 3.
     order.clear();
     for (size_t i = 0; i < pkgs.size(); ++i) {
         for (const PackageBasicInfo& dep : pkgs[i].dep_packages) {
@@ -371,9 +352,7 @@ bool PackageManager::getAncestryDependencyOrder(const char* name, std::vector<Pa
             }
         }
     }
-    // 4.
     graph.visit(vertex[name]);
-    // 5.
     std::vector<PackageInfo> ancestry;
     for (const std::string& pkg : graph.getResult()) {
         ancestry.push_back(records[pkg]);
@@ -383,7 +362,6 @@ bool PackageManager::getAncestryDependencyOrder(const char* name, std::vector<Pa
     if (order.empty()) {
         order.push_back(name);
     }
-    // 6.
     std::vector<PackageInfo> sorted;
     for (const std::string& pkg : order) {
         auto it = records.find(pkg);

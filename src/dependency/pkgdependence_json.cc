@@ -38,13 +38,11 @@ int PMSParseDepJSON(const Json::Value& json, DepPkgVector& out) {
     int applied = 0;
     for (const std::string& name : json.getMemberNames()) {
         const Json::Value& bounds = json[name];
-        // 1.
         if (!bounds.isObject() || bounds.empty()) {
             out.pushDepPkg(name, "0", PKG_COMPOP_NONE);
             ++applied;
             continue;
         }
-        // 2.
         int os[3];
         if (osVersionMember(bounds, "nos_min_ver", os) && PMSCompareOSVersion(os) < 0) {
             continue;
@@ -52,7 +50,7 @@ int PMSParseDepJSON(const Json::Value& json, DepPkgVector& out) {
         if (osVersionMember(bounds, "nos_max_ver", os) && PMSCompareOSVersion(os) > 0) {
             continue;
         }
-        // 3 to 7. The long names win over the operators.
+        // The long names win over the operators.
         ++applied;
         bool bounded = false;
         bounded |= pushBound(out, name, bounds, "pkg_min_ver", PKG_COMPOP_GE) ||

@@ -15,6 +15,7 @@
 #include "corvpkg/pkgtool.h"
 #include "corvpkg/pkgvolume.h"
 #include "lifecycle/lifecycle_private.h"
+#include "lifecycle/road.h"
 
 namespace CORVPackageTool {
 
@@ -29,17 +30,312 @@ PKG_ERRCODE spaceOr(PKG_ERRCODE otherwise) {
     return VLIBCErrGet() == ERR_NO_SPACE ? PKG_ERR_NO_SPACE : otherwise;
 }
 
-// The event numbers of the system event log: success and failure per action.
-void logEvent(int action, bool success, const std::string& displayname) {
-    unsigned code = action == kActionRepair    ? 0x13700005
-                    : action == kActionUpgrade ? 0x13700003
-                                               : 0x13700001;
-    if (success) {
-        CORVLogSet1(2, 1, code, displayname.c_str(), "", "", "");
-    } else {
-        CORVLogSet1(2, 3, code + 1, displayname.c_str(), "", "", "");
+// What the dispatcher's steps share: the package file, what it holds, what is installed
+// under its name, and where the operation is to run.
+struct Dispatch {
+    PackageManager& pm;
+    const char* userName;
+    const std::string& cpkPath;
+    const std::string& volume;
+    const bool startAfterInstall;
+    const Json::Value* extra;
+    const char* language;
+    const bool ignoreDependents;
+    const bool checkSignature;
+    PackageInfo info{};
+    PackageInfo oldInfo{};
+    int action = kActionInstall;
+    int outcome = 0;
+    unsigned long long fileSize = 0;
+    unsigned long long size = 0;
+    std::string wanted{};
+    std::string targetVolume{};
+    std::string storeRoot{};
+    std::string tmpRoot{};
+};
+
+// Without a file there is nothing to say; a path that is not a plain file is a broken one.
+bool checkFile(Dispatch& r) {
+    if (r.cpkPath.empty()) {
+        return false;
+    }
+    struct stat st {};
+    if (stat(r.cpkPath.c_str(), &st) != 0 || !S_ISREG(st.st_mode)) {
+        r.pm.setResult(PKG_ERR_BROKEN);
+        CORV_LOG_ERR("Fail to get cpk file, %s", r.cpkPath.c_str());
+        return false;
+    }
+    r.fileSize = static_cast<unsigned long long>(st.st_size);
+    return true;
+}
+
+bool initManager(Dispatch& r) {
+    return r.pm.init();
+}
+
+bool readPackageFile(Dispatch& r) {
+    if (!r.pm.queryPackageFileInfo(r.cpkPath, r.info, static_cast<PKG_INSTALLATION_TYPE>(0),
+                                   r.language)) {
+        r.pm.setResult(PKG_ERR_BROKEN);
+        CORV_LOG_ERR("Fail to get package info");
+        return false;
+    }
+    return true;
+}
+
+bool checkSignature(Dispatch& r) {
+    if (!r.checkSignature) {
+        return true;
+    }
+    const PKG_ERRCODE verdict = r.pm.verifyPackageSignature(r.cpkPath.c_str());
+    if (verdict != PKG_SIGNATURE_OK) {
+        r.pm.setResult(verdict);
+        CORV_LOG_ERR("Check codesign failed");
+        return false;
+    }
+    return true;
+}
+
+bool checkCycle(Dispatch& r) {
+    if (r.pm.hasCycle(r.info)) {
+        r.pm.setResult(PKG_ERR_DEPENDENCY_CYCLE);
+        return false;
+    }
+    return true;
+}
+
+bool lock(Dispatch& r) {
+    if (!PackageManager::ExLock(180)) {
+        CORV_LOG_ERR("Failed to lock, %s", r.info.package.c_str());
+        r.pm.setResult(PKG_ERR_LOCKED);
+        return false;
+    }
+    return true;
+}
+
+// Install, upgrade or repair, from what the name's status says. An INFO that no longer
+// reads cannot be upgraded from: repair, and let the registration write a good one.
+bool chooseAction(Dispatch& r) {
+    bool running = false;
+    r.pm.getServiceStatus(r.info.package, running, true);
+    switch (r.pm.getResult()) {
+        case PKG_ERR_NOT_INSTALLED:
+            r.action = kActionInstall;
+            break;
+        case PKG_ERR_BROKEN:
+        case PKG_ERR_ARCH_MISMATCH:
+        case PKG_ERR_BELOW_VERSION_LIMIT:
+            r.action = kActionRepair;
+            break;
+        default:
+            r.action = kActionUpgrade;
+    }
+    const std::string info = PMSRegistryEntry(r.info.package, kRegistryInfo);
+    if (access(info.c_str(), F_OK) == 0 &&
+        !r.pm.getPackageInfo(r.info.package, r.oldInfo, nullptr, PKG_INFO_MASK_ALL)) {
+        r.action = kActionRepair;
+        unlink(info.c_str());
+    }
+    return true;
+}
+
+// Where the package lives already, unless the unit has a fixed place for it; else a saved
+// default volume, which wins over the caller's choice.
+bool chooseVolume(Dispatch& r) {
+    if (VLIBCIsDockette()) {
+        r.wanted = "/volume1";
+    } else if (r.info.install_type == "system") {
+        if (!PMSGetSystemInstallPath(r.wanted)) {
+            return false;
+        }
+    } else if (r.action & (kActionUpgrade | kActionRepair)) {
+        r.wanted = PMSGetPackageTarget(r.info.package);
+        if (r.wanted.empty()) {
+            const std::string target = PMSRegistryEntry(r.info.package, kRegistryTarget);
+            VLIBCExec("/bin/rm", "-rf", target.c_str(), nullptr);
+            CORV_LOG_ERR("%s, Failed to get volume", r.info.package.c_str());
+            if (r.action == kActionUpgrade) {
+                return false;
+            }
+        }
+        if (r.oldInfo.install_type == "system" && r.info.install_type != "system") {
+            r.wanted.clear();
+        }
+    }
+    if (r.wanted.empty() && !PMSGetPackageDefVol(r.wanted)) {
+        r.wanted = r.volume;
+    }
+    return true;
+}
+
+// The space the payload needs: what the package says, else half again the file's size.
+bool measureSpace(Dispatch& r) {
+    r.size = r.info.extractsize != 0 ? static_cast<unsigned long long>(r.info.extractsize)
+                                     : r.fileSize * 3 / 2;
+    if (r.wanted.empty() && !PMSGetTmpDir(r.size, r.wanted)) {
+        r.pm.setResult(spaceOr(PKG_ERR_SYSTEM));
+        CORV_LOG_ERR("No available tmp path");
+        return false;
+    }
+    return true;
+}
+
+// A repair whose volume no longer fits may move to any volume with room.
+bool findStoreVolume(Dispatch& r) {
+    if (r.pm.GetAppStoreVolume(r.info, r.wanted.c_str(), r.size, r.targetVolume)) {
+        return true;
+    }
+    if (r.action == kActionRepair && !VLIBCIsDockette() && r.info.install_type != "system") {
+        if (!PMSGetTmpDir(r.size, r.wanted)) {
+            r.pm.setResult(spaceOr(PKG_ERR_SYSTEM));
+            CORV_LOG_ERR("No available tmp path");
+            return false;
+        }
+        if (r.pm.GetAppStoreVolume(r.info, r.wanted.c_str(), r.size, r.targetVolume)) {
+            return true;
+        }
+        CORV_LOG_ERR("Failed to get installation volume %s", r.wanted.c_str());
+    }
+    r.pm.setResult(spaceOr(PKG_ERR_VOLUME_CHECK));
+    if (r.pm.getResult() == PKG_ERR_NO_SPACE) {
+        PMSReportNoSpace(r.pm, r.wanted, r.size + PKG_VOLUME_MARGIN, PMSFreeBytes(r.wanted));
+    }
+    return false;
+}
+
+bool makeStoreRoot(Dispatch& r) {
+    r.storeRoot = r.targetVolume + "/@appstore";
+    if (CORVFSMkdirP(r.storeRoot.c_str(), nullptr, 1, -1, -1, 0755) < 0) {
+        CORV_LOG_ERR("Failed to check appstore %s", r.storeRoot.c_str());
+        r.pm.setResult(PKG_ERR_VOLUME_CHECK);
+        return false;
+    }
+    return true;
+}
+
+bool findTmpDir(Dispatch& r) {
+    if (!PMSGetTmpDir(0, r.targetVolume.c_str(), r.tmpRoot) && !PMSGetSystemTmpDir(0, r.tmpRoot)) {
+        CORV_LOG_ERR("Failed to check tmpdir %s", r.targetVolume.c_str());
+        r.pm.setResult(spaceOr(PKG_ERR_SYSTEM));
+        return false;
+    }
+    return true;
+}
+
+// What cannot be upgraded into shape is removed and installed afresh.
+void reinstall(Dispatch& r) {
+    bool running = false;
+    r.pm.getServiceStatus(r.info.package, running, true);
+    const PKG_ERRCODE status = r.pm.getResult();
+    if (status != PKG_ERR_NO_STATUS_SCRIPT && status != PKG_ERR_ARCH_MISMATCH &&
+        status != PKG_ERR_BROKEN) {
+        CORV_LOG_ERR("Failed to repair package %s, status: %d", r.info.package.c_str(),
+                     static_cast<int>(status));
+        r.outcome = 0;
+        return;
+    }
+    if (!r.pm.uninstall(r.info.package, nullptr, r.language, static_cast<PKG_INSTALLATION_TYPE>(4),
+                        true, nullptr)) {
+        CORV_LOG_ERR("Failed to remove package %s, err: %d", r.info.package.c_str(),
+                     static_cast<int>(r.pm.getResult()));
+    }
+    r.outcome = r.pm.install_package(r.cpkPath, r.targetVolume, r.storeRoot, r.tmpRoot, true,
+                                     r.extra, r.language, r.userName);
+    if (r.outcome == 0) {
+        CORV_LOG_ERR("Failed to install package %s, err: %d", r.info.package.c_str(),
+                     static_cast<int>(r.pm.getResult()));
     }
 }
+
+// A repair is an upgrade onto the broken package; an older file is refused as such.
+void repair(Dispatch& r) {
+    r.pm.setResult(PKG_ERR_REPAIR_FAILED);
+    r.outcome = r.pm.upgrade_package(r.cpkPath, r.targetVolume, r.storeRoot, r.tmpRoot, true,
+                                     r.extra, r.language, r.userName, r.ignoreDependents);
+    if (r.outcome == 0 && r.pm.getResult() != PKG_ERR_DOWNGRADE) {
+        reinstall(r);
+    }
+}
+
+// The presets are crossed on purpose: each names the other road's failure, and stays when
+// the road gives up without a result of its own.
+bool runOperation(Dispatch& r) {
+    if (r.action & kActionRepair) {
+        repair(r);
+    } else if (r.action & kActionUpgrade) {
+        r.pm.setResult(PKG_ERR_INSTALL_FAILED);
+        r.outcome = r.pm.upgrade_package(r.cpkPath, r.targetVolume, r.storeRoot, r.tmpRoot, false,
+                                         r.extra, r.language, r.userName, r.ignoreDependents);
+    } else {
+        r.pm.setResult(PKG_ERR_UPGRADE_FAILED);
+        r.outcome = r.pm.install_package(r.cpkPath, r.targetVolume, r.storeRoot, r.tmpRoot,
+                                         r.startAfterInstall, r.extra, r.language, r.userName);
+    }
+    return r.outcome == 1;
+}
+
+constexpr RoadStep<Dispatch> kDispatchSteps[] = {
+    {"check-file", checkFile},
+    {"init", initManager},
+    {"read-package-file", readPackageFile},
+    {"check-signature", checkSignature},
+    {"check-cycle", checkCycle},
+    {"lock", lock},
+    {"choose-action", chooseAction},
+    {"choose-volume", chooseVolume},
+    {"measure-space", measureSpace},
+    {"find-store-volume", findStoreVolume},
+    {"make-store-root", makeStoreRoot},
+    {"find-tmp-dir", findTmpDir},
+    {"run-operation", runOperation},
+};
+
+// Released on every road, also on those that never took the lock.
+bool unlock(Dispatch&) {
+    PackageManager::UnLock();
+    return true;
+}
+
+// A detached look for newer versions, not during the first boot after an OS upgrade.
+bool checkForUpgrades(Dispatch& r) {
+    if (r.outcome == 1 && !VLIBCFileExist(kUpgradeBootupFlag)) {
+        pid_t pid = VLIBCProcFork();
+        if (pid == 0) {
+            setsid();
+            PMSRunUpgradeCheck(r.userName, r.language);
+            _exit(0);
+        }
+    }
+    return true;
+}
+
+// The system event log's numbers: success and failure per action.
+bool recordEvent(Dispatch& r) {
+    if (r.info.displayname.empty()) {
+        return true;
+    }
+    const unsigned code = r.action == kActionRepair    ? 0x13700005
+                          : r.action == kActionUpgrade ? 0x13700003
+                                                       : 0x13700001;
+    if (r.outcome == 1) {
+        CORVLogSet1(2, 1, code, r.info.displayname.c_str(), "", "", "");
+    } else {
+        CORVLogSet1(2, 3, code + 1, r.info.displayname.c_str(), "", "", "");
+    }
+    return true;
+}
+
+bool cleanEnv(Dispatch&) {
+    CleanAllEnv();
+    return true;
+}
+
+constexpr RoadStep<Dispatch> kDispatchClosingSteps[] = {
+    {"unlock", unlock},
+    {"check-for-upgrades", checkForUpgrades},
+    {"record-event", recordEvent},
+    {"clean-env", cleanEnv},
+};
 
 }  // namespace
 
@@ -47,208 +343,11 @@ int PackageManager::install(const char* userName, const std::string& cpkPath,
                             const std::string& volume, bool startAfterInstall,
                             const Json::Value* extra, const char* language, bool ignoreDependents,
                             bool checkSignature) {
-    PackageInfo info;
-    PackageInfo oldInfo;
-    int action = kActionInstall;
-    int outcome = 0;
-    bool running = false;
-    struct stat st {};
-    std::string wanted;
-    std::string targetVolume;
-    std::string storeRoot;
-    std::string tmpRoot;
-    std::string registry;
-    unsigned long long size = 0;
-
-    // 1.
-    if (cpkPath.empty()) {
-        goto leave;
-    }
-    // 2.
-    if (stat(cpkPath.c_str(), &st) != 0 || !S_ISREG(st.st_mode)) {
-        setResult(PKG_ERR_BROKEN);
-        CORV_LOG_ERR("Fail to get cpk file, %s", cpkPath.c_str());
-        goto leave;
-    }
-    // 3.
-    if (!init()) {
-        goto leave;
-    }
-    // 4.
-    if (!queryPackageFileInfo(cpkPath, info, static_cast<PKG_INSTALLATION_TYPE>(0), language)) {
-        setResult(PKG_ERR_BROKEN);
-        CORV_LOG_ERR("Fail to get package info");
-        goto leave;
-    }
-    // 5.
-    if (checkSignature) {
-        PKG_ERRCODE verdict = verifyPackageSignature(cpkPath.c_str());
-        if (verdict != PKG_SIGNATURE_OK) {
-            setResult(verdict);
-            CORV_LOG_ERR("Check codesign failed");
-            goto leave;
-        }
-    }
-    // 6.
-    if (hasCycle(info)) {
-        setResult(PKG_ERR_DEPENDENCY_CYCLE);
-        goto leave;
-    }
-    // 7.
-    if (!ExLock(180)) {
-        CORV_LOG_ERR("Failed to lock, %s", info.package.c_str());
-        setResult(PKG_ERR_LOCKED);
-        goto leave;
-    }
-    // 8.
-    getServiceStatus(info.package, running, true);
-    switch (getResult()) {
-        case PKG_ERR_NOT_INSTALLED:
-            action = kActionInstall;
-            break;
-        case PKG_ERR_BROKEN:
-        case PKG_ERR_ARCH_MISMATCH:
-        case PKG_ERR_BELOW_VERSION_LIMIT:
-            action = kActionRepair;
-            break;
-        default:
-            action = kActionUpgrade;
-    }
-    // 9. An INFO that no longer reads cannot be upgraded from: repair, and let the
-    // registration write a good one.
-    registry = PMSRegistryDir(info.package);
-    if (access((registry + "/INFO").c_str(), F_OK) == 0 &&
-        !getPackageInfo(info.package, oldInfo, nullptr, PKG_INFO_MASK_ALL)) {
-        action = kActionRepair;
-        unlink((registry + "/INFO").c_str());
-    }
-    // 10. Where the package lives already, unless the unit has a fixed place for it.
-    if (VLIBCIsDockette()) {
-        wanted = "/volume1";
-    } else if (info.install_type == "system") {
-        if (!PMSGetSystemInstallPath(wanted)) {
-            goto leave;
-        }
-    } else if (action & (kActionUpgrade | kActionRepair)) {
-        wanted = PMSGetPackageTarget(info.package);
-        if (wanted.empty()) {
-            VLIBCExec("/bin/rm", "-rf", (registry + "/target").c_str(), nullptr);
-            CORV_LOG_ERR("%s, Failed to get volume", info.package.c_str());
-            if (action == kActionUpgrade) {
-                goto leave;
-            }
-        }
-        if (oldInfo.install_type == "system" && info.install_type != "system") {
-            wanted.clear();
-        }
-    }
-    // 11. A saved default volume wins over the caller's choice.
-    if (wanted.empty() && !PMSGetPackageDefVol(wanted)) {
-        wanted = volume;
-    }
-    // 12.
-    size = info.extractsize != 0 ? static_cast<unsigned long long>(info.extractsize)
-                                 : static_cast<unsigned long long>(st.st_size) * 3 / 2;
-    // 13.
-    if (wanted.empty() && !PMSGetTmpDir(size, wanted)) {
-        setResult(spaceOr(PKG_ERR_SYSTEM));
-        CORV_LOG_ERR("No available tmp path");
-        goto leave;
-    }
-    // 14, 15.
-    if (!GetAppStoreVolume(info, wanted.c_str(), size, targetVolume)) {
-        bool retried = false;
-        if (action == kActionRepair && !VLIBCIsDockette() && info.install_type != "system") {
-            if (!PMSGetTmpDir(size, wanted)) {
-                setResult(spaceOr(PKG_ERR_SYSTEM));
-                CORV_LOG_ERR("No available tmp path");
-                goto leave;
-            }
-            retried = GetAppStoreVolume(info, wanted.c_str(), size, targetVolume);
-            if (!retried) {
-                CORV_LOG_ERR("Failed to get installation volume %s", wanted.c_str());
-            }
-        }
-        if (!retried) {
-            setResult(spaceOr(PKG_ERR_VOLUME_CHECK));
-            if (getResult() == PKG_ERR_NO_SPACE) {
-                PMSReportNoSpace(*this, wanted, size + PKG_VOLUME_MARGIN, PMSFreeBytes(wanted));
-            }
-            goto leave;
-        }
-    }
-    // 16.
-    storeRoot = targetVolume + "/@appstore";
-    if (CORVFSMkdirP(storeRoot.c_str(), nullptr, 1, -1, -1, 0755) < 0) {
-        CORV_LOG_ERR("Failed to check appstore %s", storeRoot.c_str());
-        setResult(PKG_ERR_VOLUME_CHECK);
-        goto leave;
-    }
-    // 17.
-    if (!PMSGetTmpDir(0, targetVolume.c_str(), tmpRoot) && !PMSGetSystemTmpDir(0, tmpRoot)) {
-        CORV_LOG_ERR("Failed to check tmpdir %s", targetVolume.c_str());
-        setResult(spaceOr(PKG_ERR_SYSTEM));
-        goto leave;
-    }
-    if (action & kActionRepair) {
-        // 18.
-        setResult(PKG_ERR_REPAIR_FAILED);
-        outcome = upgrade_package(cpkPath, targetVolume, storeRoot, tmpRoot, true, extra, language,
-                                  userName, ignoreDependents);
-        if (outcome == 0 && getResult() != PKG_ERR_DOWNGRADE) {
-            // 19. What cannot be upgraded is removed and installed afresh.
-            getServiceStatus(info.package, running, true);
-            PKG_ERRCODE status = getResult();
-            if (status == PKG_ERR_NO_STATUS_SCRIPT || status == PKG_ERR_ARCH_MISMATCH ||
-                status == PKG_ERR_BROKEN) {
-                if (!uninstall(info.package, nullptr, language,
-                               static_cast<PKG_INSTALLATION_TYPE>(4), true, nullptr)) {
-                    CORV_LOG_ERR("Failed to remove package %s, err: %d", info.package.c_str(),
-                                 static_cast<int>(getResult()));
-                }
-                outcome = install_package(cpkPath, targetVolume, storeRoot, tmpRoot, true, extra,
-                                          language, userName);
-                if (outcome == 0) {
-                    CORV_LOG_ERR("Failed to install package %s, err: %d", info.package.c_str(),
-                                 static_cast<int>(getResult()));
-                }
-            } else {
-                CORV_LOG_ERR("Failed to repair package %s, status: %d", info.package.c_str(),
-                             static_cast<int>(status));
-                outcome = 0;
-            }
-        }
-    } else if (action & kActionUpgrade) {
-        // 20. The presets are crossed on purpose: each names the other road's failure.
-        setResult(PKG_ERR_INSTALL_FAILED);
-        outcome = upgrade_package(cpkPath, targetVolume, storeRoot, tmpRoot, false, extra, language,
-                                  userName, ignoreDependents);
-    } else {
-        // 21.
-        setResult(PKG_ERR_UPGRADE_FAILED);
-        outcome = install_package(cpkPath, targetVolume, storeRoot, tmpRoot, startAfterInstall,
-                                  extra, language, userName);
-    }
-
-leave:
-    // 22.
-    UnLock();
-    // 23.
-    if (outcome == 1 && !VLIBCFileExist(kUpgradeBootupFlag)) {
-        pid_t pid = VLIBCProcFork();
-        if (pid == 0) {
-            setsid();
-            PMSRunUpgradeCheck(userName, language);
-            _exit(0);
-        }
-    }
-    // 24.
-    if (!info.displayname.empty()) {
-        logEvent(action, outcome == 1, info.displayname);
-    }
-    // 25.
-    CleanAllEnv();
-    return outcome;
+    Dispatch r{*this, userName, cpkPath,          volume,        startAfterInstall,
+               extra, language, ignoreDependents, checkSignature};
+    PMSRunRoad("dispatch", r, kDispatchSteps);
+    PMSRunClosingSteps("dispatch", r, kDispatchClosingSteps);
+    return r.outcome;
 }
 
 int PackageManager::install(const char* userName, const std::string& cpkPath,

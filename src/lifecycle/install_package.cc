@@ -2,8 +2,6 @@
 // volume, register, run postinst and start. The road has no rollback of its own; what each
 // failure leaves behind is what the next install call (a repair) expects to find.
 #include <fcntl.h>
-#include <openssl/evp.h>
-#include <stdarg.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <sys/stat.h>
@@ -29,13 +27,13 @@
 #include "corvpkg/resource.h"
 #include "lifecycle/install_private.h"
 #include "lifecycle/lifecycle_private.h"
+#include "lifecycle/road.h"
 
 namespace CORVPackageTool {
 
 namespace {
 
 constexpr const char* kGuestGroup = "CorvelGuests";
-constexpr unsigned long long kInstallInfoMask = 0xFFFFFFFFF7FFFFFFULL;
 
 // Closes the package's desktop applications to guests. Failures are logged: they never
 // fail an installation.
@@ -63,357 +61,318 @@ void denyGuestAccess(const PackageInfo& info) {
     }
 }
 
-}  // namespace
+constexpr PKG_INSTALLATION_TYPE kInstall = static_cast<PKG_INSTALLATION_TYPE>(1);
 
-InstallCommands::InstallCommands(const std::string& cpkPath, const std::string& workDir)
-    : removeWorkDir("/bin/rm", {"-rf", workDir}),
-      makeWorkDir("/bin/mkdir", {"-p", workDir + "/package"}),
-      repairExtract("/bin/tar", {"xf", cpkPath, "-C", workDir, "INFO", "conf", "--no-same-owner"}),
-      extractAll("/bin/tar", {"xf", cpkPath, "-C", workDir, "--no-same-owner"}),
-      extractPayload("/bin/tar", {"xf", workDir + "/package.tgz", "-C", workDir + "/package",
-                                  "--no-same-owner"}) {}
+// What the steps of a fresh installation share. The package's record is the manager's own,
+// so that afterwards the manager describes the new package.
+struct InstallRoad {
+    PackageManager& pm;
+    PackageInfo& info;
+    const std::string& cpkPath;
+    const std::string& volume;
+    const std::string& storeRoot;
+    const std::string workDir;
+    const bool startAfterInstall;
+    const Json::Value* extra;
+    const char* language;
+    const char* userName;
+    InstallCommands cmd;
+    CORV::PkgUtils::WorkerResp resp{};
+    ScriptContext scripts{};
+    std::string target{};
+    std::string registry{};
+    std::string progressPath{};
+    bool postinstAcquireFailed = false;
+    unsigned long long restartMask = 0;
+    int outcome = 0;
+};
 
-bool PMSRunLogged(const PackageInfo& info, PKG_INSTALLATION_TYPE type,
-                  CORVUtils::ProcessRunner& runner) {
-    return PMSRunAndWriteScriptLog(info, type, runner, -1) == 0;
+// The status query leaves PKG_ERR_NOT_INSTALLED for a name that is free.
+bool checkNotInstalled(InstallRoad& r) {
+    bool running = false;
+    r.pm.getServiceStatus(r.info.package, running, true);
+    if (r.pm.getResult() != PKG_ERR_NOT_INSTALLED) {
+        CORV_LOG_ERR("Package %s already installed", r.info.package.c_str());
+        r.pm.setResult(PKG_ERR_ALREADY_INSTALLED);
+        return false;
+    }
+    return true;
 }
 
-bool PMSUnpackAndCheck(PackageManager& pm, PKG_INSTALLATION_TYPE type, InstallCommands& cmd,
-                       const std::string& cpkPath, const std::string& workDir, PackageInfo& info,
-                       bool nameTheDir) {
-    // 2.
+bool unpackPayload(InstallRoad& r) {
+    if (!PMSRunLogged(r.info, kInstall, r.cmd.extractPayload) ||
+        !PMSDropSpecialFiles(r.workDir + "/package")) {
+        CORV_LOG_ERR("Failed to unpack package.tgz, %s", r.cpkPath.c_str());
+        PMSExplainFailedUnpack(r.pm, r.workDir + "/package", PMSPayloadSize(r.info, r.workDir));
+        r.pm.setResult(PKG_ERR_BAD_ARCHIVE);
+        return false;
+    }
+    return true;
+}
+
+// The message file the scripts write to, a fresh progress file, and what every install
+// script of this road is given.
+bool prepareMessages(InstallRoad& r) {
+    r.progressPath = PMSGetProgressPath(r.info.package);
+    unlink(r.progressPath.c_str());
+    r.scripts =
+        ScriptContext{r.language,        r.pm.getFixedLogFilePath(r.info.package),
+                      r.extra,           r.volume.c_str(),
+                      r.cpkPath.c_str(), r.userName,
+                      &r.resp,           {{"CORVPKG_PKGINST_TEMP_DIR", r.workDir + "/package"}}};
+    return true;
+}
+
+// Owners and modes of the unpacked files, and the resource request every package has.
+// A failure leaves the result of the status query.
+bool reviseFileAttributes(InstallRoad& r) {
+    return Privilege::ReviseFileAttr(r.info.package, r.workDir) &&
+           Resource::InitRequiredFields(r.info.package, r.workDir);
+}
+
+bool acquirePreinstResources(InstallRoad& r) {
+    if (!Resource::Acquire(Resource::TIMING_PREINST, r.info, kInstall, r.resp, r.extra,
+                           r.workDir)) {
+        CORV_LOG_ERR("Failed to acquire resource before install %s [0x%04X %s:%d]",
+                     r.info.package.c_str(), VLIBCErrGet(), VLIBCErrorGetFile(),
+                     VLIBCErrorGetLine());
+        r.pm.insertJsonParam("worker_msg", r.resp.GetErrJsonArray());
+        r.pm.setResult(PKG_ERR_INSTALL_FAILED);
+        return false;
+    }
+    return true;
+}
+
+// The script runs from the work directory, before anything is registered, with the
+// identity that the package's own conf/privilege there gives it.
+bool runPreinst(InstallRoad& r) {
+    const std::string script = r.workDir + "/scripts/preinst";
+    if (!PMSCheckIsExec(script)) {
+        return true;
+    }
+    const int ret =
+        PMSRunInstallScript(r.info, script, "preinst", kInstall, r.scripts, true, r.workDir);
+    if (ret != 0) {
+        if (ret != kScriptIdentityFailed) {
+            CORV_LOG_ERR("Failed to run preinst script for %s, [%d]", r.info.package.c_str(), ret);
+        }
+        r.pm.setResult(PKG_ERR_SYSTEM);
+        return false;
+    }
+    return true;
+}
+
+bool clearTarget(InstallRoad& r) {
+    r.target = r.storeRoot + "/" + r.info.package;
+    return PMSClearTarget(r.info, kInstall, r.target);
+}
+
+bool movePayload(InstallRoad& r) {
+    CORVUtils::ProcessRunner mv("/bin/mv", {"-f", r.workDir + "/package", r.target});
+    if (!PMSRunLogged(r.info, kInstall, mv)) {
+        CORV_LOG_ERR("Failed to move package files, %s", r.target.c_str());
+        r.pm.setResult(PKG_ERR_SYSTEM);
+        return false;
+    }
+    return true;
+}
+
+// A registry left over from an earlier, failed road would mix with the new one.
+bool dropOldRegistry(InstallRoad& r) {
+    r.registry = PMSRegistryDir(r.info.package);
+    if (!r.info.package.empty()) {
+        CORVUtils::ProcessRunner rm("/bin/rm", {"-rf", r.registry});
+        PMSRunLogged(r.info, kInstall, rm);
+    }
     if (!PackageManager::ExLock(180)) {
-        pm.setResult(PKG_ERR_LOCKED);
+        CORV_LOG_ERR("Failed to lock, %s", r.info.package.c_str());
+        r.pm.setResult(PKG_ERR_LOCKED);
         return false;
     }
-    // 3.
-    PMSRunLogged(info, type, cmd.removeWorkDir);
-    if (!PMSRunLogged(info, type, cmd.makeWorkDir)) {
-        CORV_LOG_ERR("Failed to create install dir %s", workDir.c_str());
-        pm.setResult(PKG_ERR_SYSTEM);
+    return true;
+}
+
+// A preinst may have damaged the INFO it was unpacked with: read it again, from the
+// package file if need be.
+bool checkInfo(InstallRoad& r) {
+    if (PMSInfoFileUsable(r.workDir) ||
+        PMSLoadPKGInfoFile(r.workDir, r.info, nullptr, kInstallInfoMask)) {
+        return true;
+    }
+    CORV_LOG_ERR("Failed to validate package INFO in %s", r.workDir.c_str());
+    PMSRunLogged(r.info, kInstall, r.cmd.repairExtract);
+    if (!PMSLoadPKGInfoFile(r.workDir, r.info, nullptr, kInstallInfoMask)) {
+        CORV_LOG_ERR("Failed to validate package INFO");
+        r.pm.setResult(PKG_ERR_BAD_ARCHIVE);
         return false;
     }
-    // 4.
-    if (!PMSRunLogged(info, type, cmd.extractAll) || !PMSCheckPackageMembers(workDir)) {
-        CORV_LOG_ERR("Failed to extract package, %s", cpkPath.c_str());
-        PMSExplainFailedUnpack(pm, workDir, PMSFileBytes(cpkPath));
-        pm.setResult(PKG_ERR_BAD_ARCHIVE);
+    return true;
+}
+
+bool foldIcons(InstallRoad& r) {
+    const PKG_ERRCODE icons = PMSFoldIcons(r.workDir, r.info.package);
+    if (icons != PKG_OK) {
+        r.pm.setResult(icons);
         return false;
     }
-    // 5.
-    if (!PMSLoadPKGInfoFile(workDir, info, nullptr, kInstallInfoMask)) {
-        if (nameTheDir) {
-            CORV_LOG_ERR("Failed to validate package INFO in %s", workDir.c_str());
-        } else {
-            CORV_LOG_ERR("Failed to validate package INFO");
+    return true;
+}
+
+// From here on the package is there: whatever follows, the daemons it names are reloaded.
+bool registerPackage(InstallRoad& r) {
+    if (!r.pm.registerPackage(kInstall, r.info, r.workDir, r.target)) {
+        CORV_LOG_ERR("Failed to register package for %s", r.info.package.c_str());
+        r.pm.setResult(PKG_ERR_SYSTEM);
+        return false;
+    }
+    r.restartMask = r.info.instuninst_restart_services;
+    return true;
+}
+
+// A failure is only noted: postinst still runs, the package may need its own cleanup.
+bool acquirePostinstResources(InstallRoad& r) {
+    if (!Resource::Acquire(Resource::TIMING_POSTINST, r.info, kInstall, r.resp, r.extra, "")) {
+        r.postinstAcquireFailed = true;
+        CORV_LOG_ERR("Failed to acquire resource after install %s [0x%04X %s:%d]",
+                     r.info.package.c_str(), VLIBCErrGet(), VLIBCErrorGetFile(),
+                     VLIBCErrorGetLine());
+        r.pm.insertJsonParam("worker_msg", r.resp.GetErrJsonArray());
+    }
+    return true;
+}
+
+bool closeToGuests(InstallRoad& r) {
+    denyGuestAccess(r.info);
+    return true;
+}
+
+// postinst runs from the registry now, with the registered conf/privilege.
+bool runPostinst(InstallRoad& r) {
+    const std::string script = r.registry + "/scripts/postinst";
+    if (!PMSCheckIsExec(script)) {
+        return true;
+    }
+    const int ret = PMSRunInstallScript(r.info, script, "postinst", kInstall, r.scripts, true, "");
+    if (ret != 0) {
+        if (ret != kScriptIdentityFailed) {
+            CORV_LOG_ERR("Failed to run postinst script for %s, %d", r.info.package.c_str(), ret);
         }
-        pm.setResult(PKG_ERR_BAD_ARCHIVE);
-        return false;
-    }
-    // 6.
-    if (!PMSCheckPackageArchModelMatched(info)) {
-        CORV_LOG_ERR("Unsupported system arch");
-        pm.setResult(PKG_ERR_ARCH_MISMATCH);
-        return false;
-    }
-    // 7.
-    if (!pm.CanPackageStartInThisFirmware(info)) {
-        CORV_LOG_ERR("Cannot start package [%s], version %s in this NOS version",
-                     info.package.c_str(), info.version.c_str());
-        return false;
-    }
-    // 8.
-    if (access((workDir + "/package.tgz").c_str(), F_OK) != 0) {
-        CORV_LOG_ERR("Failed to locate %s/package.tgz", workDir.c_str());
-        pm.setResult(PKG_ERR_BAD_ARCHIVE);
+        r.pm.setResult(PKG_ERR_SYSTEM);
         return false;
     }
     return true;
 }
 
-bool PMSInfoFileUsable(const std::string& workDir) {
-    struct stat st {};
-    return stat((workDir + "/INFO").c_str(), &st) == 0 && st.st_size > 0;
-}
-
-bool PMSClearTarget(const PackageInfo& info, PKG_INSTALLATION_TYPE type,
-                    const std::string& target) {
-    if (access(target.c_str(), F_OK) != 0) {
-        return true;
-    }
-    CORVUtils::ProcessRunner rm("/bin/rm", {"-rf", target});
-    if (PMSRunLogged(info, type, rm)) {
-        return true;
-    }
-    // What cannot be removed (busy files, a read-only subtree) is moved out of the way on
-    // the same volume, so that the new payload gets a clean place.
-    std::string tmp;
-    if (!PMSGetTmpDir(0, target.c_str(), tmp) && !PMSGetSystemTmpDir(0, tmp)) {
-        tmp = "/tmp";
-    }
-    std::string templ = tmp + "/pkg_XXXXXX";
-    std::vector<char> buffer(templ.begin(), templ.end());
-    buffer.push_back('\0');
-    if (mkdtemp(buffer.data()) == nullptr) {
-        CORV_LOG_ERR("Failed to create a temp directory in %s.", tmp.c_str());
-        return false;
-    }
-    CORVUtils::ProcessRunner mv("/bin/mv", {"-f", target, buffer.data()});
-    if (!PMSRunLogged(info, type, mv)) {
-        CORV_LOG_ERR("Failed to run %s for %s", mv.toString().c_str(), info.package.c_str());
+// The registry keeps `installing`: the package shows as broken until it is repaired.
+bool checkPostinstResources(InstallRoad& r) {
+    if (r.postinstAcquireFailed) {
+        r.pm.setResult(PKG_ERR_INSTALL_FAILED);
         return false;
     }
     return true;
 }
 
-namespace {
-
-// The icon file in base64, or "" when it cannot be read or encoded.
-std::string encodeIcon(const std::string& path) {
-    std::string raw;
-    if (!PMReadFile(path.c_str(), 0x4000000, raw, nullptr)) {
-        return "";
-    }
-    std::string encoded(4 * ((raw.size() + 2) / 3) + 1, '\0');
-    int n = EVP_EncodeBlock(reinterpret_cast<unsigned char*>(&encoded[0]),
-                            reinterpret_cast<const unsigned char*>(raw.data()),
-                            static_cast<int>(raw.size()));
-    encoded.resize(n < 0 ? 0 : static_cast<size_t>(n));
-    return encoded;
+bool finishInstallation(InstallRoad& r) {
+    r.pm.post_install(r.info);
+    unlink(r.progressPath.c_str());
+    unlink(PMSInstallingFlagPath(r.info.package).c_str());
+    r.outcome = 1;
+    return true;
 }
+
+// A package without a stop control runs whatever the caller asked. The outcome stays a
+// success whatever the start gives.
+bool startPackage(InstallRoad& r) {
+    if (!r.startAfterInstall && r.info.startable) {
+        return true;
+    }
+    std::vector<std::string> order;
+    if (!r.pm.getDependencyOrder(r.info.package.c_str(), order, false)) {
+        order = {r.info.package};
+    }
+    r.restartMask |= r.pm.findRestartServices(order);
+    const std::string name = r.info.package;
+    r.pm.serviceControl(kInstall, name, true, r.language, r.userName, nullptr, true, false);
+    return true;
+}
+
+constexpr RoadStep<InstallRoad> kInstallSteps[] = {
+    {"check-not-installed", checkNotInstalled},
+    {"unpack-payload", unpackPayload},
+    {"prepare-messages", prepareMessages},
+    {"revise-file-attributes", reviseFileAttributes},
+    {"acquire-preinst-resources", acquirePreinstResources},
+    {"run-preinst", runPreinst},
+    {"clear-target", clearTarget},
+    {"move-payload", movePayload},
+    {"drop-old-registry", dropOldRegistry},
+    {"check-info", checkInfo},
+    {"fold-icons", foldIcons},
+    {"register", registerPackage},
+    {"acquire-postinst-resources", acquirePostinstResources},
+    {"close-to-guests", closeToGuests},
+    {"run-postinst", runPostinst},
+    {"check-postinst-resources", checkPostinstResources},
+    {"finish-installation", finishInstallation},
+    {"start", startPackage},
+};
+
+bool restartServices(InstallRoad& r) {
+    if (r.restartMask != 0) {
+        r.pm.RestartServicesAction(r.restartMask);
+    }
+    return true;
+}
+
+// A road that never got the lock must not touch a work directory that may be another's.
+bool removeWorkDir(InstallRoad& r) {
+    if (r.pm.getResult() != PKG_ERR_LOCKED && VLIBCFileCheckDir(r.workDir.c_str())) {
+        PMSRunLogged(r.info, kInstall, r.cmd.removeWorkDir);
+    }
+    return true;
+}
+
+bool logOutcome(InstallRoad& r) {
+    PMSWriteSysLogf("%s %s %s %s", "install", r.info.package.c_str(), r.info.version.c_str(),
+                    r.outcome ? "successfully" : "failed");
+    return true;
+}
+
+bool runHooks(InstallRoad& r) {
+    PMSCheckServiesStatus(r.info, nullptr, kInstall, -1);
+    return true;
+}
+
+constexpr RoadStep<InstallRoad> kInstallClosingSteps[] = {
+    {"restart-services", restartServices},
+    {"remove-work-dir", removeWorkDir},
+    {"log-outcome", logOutcome},
+    {"run-hooks", runHooks},
+};
 
 }  // namespace
-
-PKG_ERRCODE PMSFoldIcons(const std::string& workDir, const std::string& name) {
-    const std::string infoPath = workDir + "/INFO";
-    const std::string small = workDir + "/PACKAGE_ICON.PNG";
-    if (access(small.c_str(), F_OK) == 0) {
-        const std::string data = encodeIcon(small);
-        if (data.empty()) {
-            CORV_LOG_ERR("Failed to encode package 72x72 icon, PACKAGE_ICON.PNG for %s",
-                         name.c_str());
-            return PKG_ERR_BAD_ARCHIVE;
-        }
-        if (VLIBCFileSetKeyValue(infoPath.c_str(), "package_icon", data.c_str(), "%s=\"%s\"\n") ==
-            -1) {
-            CORV_LOG_ERR("Failed to save 72x72 icon data for %s", name.c_str());
-            return PKG_ERR_BAD_ARCHIVE;
-        }
-    }
-    const std::string big = workDir + "/PACKAGE_ICON_256.PNG";
-    if (access(big.c_str(), F_OK) == 0) {
-        const std::string data = encodeIcon(big);
-        if (data.empty()) {
-            CORV_LOG_ERR("Failed to encode package 256x256 icon, PACKAGE_ICON_256.PNG for %s",
-                         name.c_str());
-            return PKG_ERR_BAD_ARCHIVE;
-        }
-        if (VLIBCFileSetKeyValue(infoPath.c_str(), "package_icon_256", data.c_str(),
-                                 "%s=\"%s\"\n") == -1) {
-            CORV_LOG_ERR("Failed to save 256x256 icon data for %s", name.c_str());
-            return PKG_ERR_BAD_ARCHIVE;
-        }
-    }
-    return PKG_OK;
-}
-
-int PMSRunInstallScript(const PackageInfo& info, const std::string& script, const char* action,
-                        PKG_INSTALLATION_TYPE type, const ScriptContext& ctx, bool dumpEnv,
-                        const std::string& identityDir) {
-    CORVUtils::ProcessRunner runner(script, {});
-    for (const auto& [name, value] : ctx.variables) {
-        runner.addEnv(name, value);
-    }
-    PMSPrepareScriptEnv(info, runner, ctx.language, &ctx.logFile, type, ctx.extra, ctx.volume,
-                        ctx.cpkPath, ctx.userName);
-    if (dumpEnv && ctx.resp != nullptr) {
-        ctx.resp->DumpEnv(runner);
-    }
-    if (!Privilege::SetIdentity(runner, info.package, action, identityDir)) {
-        CORV_LOG_ERR("Failed to set identity for %s [0x%04X %s:%d]", info.package.c_str(),
-                     VLIBCErrGet(), VLIBCErrorGetFile(), VLIBCErrorGetLine());
-        return kScriptIdentityFailed;
-    }
-    return PMSRunAndWriteScriptLog(info, type, runner, 0x90);
-}
 
 int PackageManager::install_package(const std::string& cpkPath, const std::string& volume,
                                     const std::string& storeRoot, const std::string& tmpRoot,
                                     bool startAfterInstall, const Json::Value* extra,
                                     const char* language, const char* userName) {
-    const PKG_INSTALLATION_TYPE type = static_cast<PKG_INSTALLATION_TYPE>(1);
-    PackageInfo& info = d->packageInfo;
     const std::string workDir = tmpRoot + "/pkginstall";
-    int outcome = 0;
-    bool running = false;
-    bool postinstAcquireFailed = false;
-    unsigned long long restartMask = 0;
-    std::string target;
-    std::string registry;
-    std::string progressPath;
-    std::string logFile;
-    CORV::PkgUtils::WorkerResp resp;
-    ScriptContext ctx;
-
-    // 1.
-    InstallCommands cmd(cpkPath, workDir);
-    // 2-8.
-    if (!PMSUnpackAndCheck(*this, type, cmd, cpkPath, workDir, info, true)) {
-        goto final;
+    InstallRoad r{*this,
+                  d->packageInfo,
+                  cpkPath,
+                  volume,
+                  storeRoot,
+                  workDir,
+                  startAfterInstall,
+                  extra,
+                  language,
+                  userName,
+                  InstallCommands(cpkPath, workDir)};
+    if (PMSUnpackAndCheck("install", *this, kInstall, r.cmd, cpkPath, workDir, r.info, true)) {
+        PMSRunRoad("install", r, kInstallSteps);
     }
-    // 9.
-    getServiceStatus(info.package, running, true);
-    if (getResult() != PKG_ERR_NOT_INSTALLED) {
-        CORV_LOG_ERR("Package %s already installed", info.package.c_str());
-        setResult(PKG_ERR_ALREADY_INSTALLED);
-        goto final;
-    }
-    // 10.
-    if (!PMSRunLogged(info, type, cmd.extractPayload) ||
-        !PMSDropSpecialFiles(workDir + "/package")) {
-        CORV_LOG_ERR("Failed to unpack package.tgz, %s", cpkPath.c_str());
-        PMSExplainFailedUnpack(*this, workDir + "/package", PMSPayloadSize(info, workDir));
-        setResult(PKG_ERR_BAD_ARCHIVE);
-        goto final;
-    }
-    // 11.
-    logFile = getFixedLogFilePath(info.package);
-    progressPath = PMSGetProgressPath(info.package);
-    unlink(progressPath.c_str());
-    // 12.
-    if (!Privilege::ReviseFileAttr(info.package, workDir) ||
-        !Resource::InitRequiredFields(info.package, workDir)) {
-        goto final;
-    }
-    // 13.
-    if (!Resource::Acquire(Resource::TIMING_PREINST, info, type, resp, extra, workDir)) {
-        CORV_LOG_ERR("Failed to acquire resource before install %s [0x%04X %s:%d]",
-                     info.package.c_str(), VLIBCErrGet(), VLIBCErrorGetFile(), VLIBCErrorGetLine());
-        insertJsonParam("worker_msg", resp.GetErrJsonArray());
-        setResult(PKG_ERR_INSTALL_FAILED);
-        goto final;
-    }
-    // 14. The script runs from the work directory, before anything is registered.
-    ctx = ScriptContext{
-        language,        logFile,  extra, volume.c_str(),
-        cpkPath.c_str(), userName, &resp, {{"CORVPKG_PKGINST_TEMP_DIR", workDir + "/package"}}};
-    if (PMSCheckIsExec(workDir + "/scripts/preinst")) {
-        int ret = PMSRunInstallScript(info, workDir + "/scripts/preinst", "preinst", type, ctx,
-                                      true, workDir);
-        if (ret == kScriptIdentityFailed) {
-            setResult(PKG_ERR_SYSTEM);
-            goto final;
-        }
-        if (ret != 0) {
-            CORV_LOG_ERR("Failed to run preinst script for %s, [%d]", info.package.c_str(), ret);
-            setResult(PKG_ERR_SYSTEM);
-            goto final;
-        }
-    }
-    // 15.
-    target = storeRoot + "/" + info.package;
-    if (!PMSClearTarget(info, type, target)) {
-        goto final;
-    }
-    // 16.
-    {
-        CORVUtils::ProcessRunner mv("/bin/mv", {"-f", workDir + "/package", target});
-        if (!PMSRunLogged(info, type, mv)) {
-            CORV_LOG_ERR("Failed to move package files, %s", target.c_str());
-            setResult(PKG_ERR_SYSTEM);
-            goto final;
-        }
-    }
-    // 17. A registry left over from an earlier, failed road would mix with the new one.
-    registry = PMSRegistryDir(info.package);
-    if (!info.package.empty()) {
-        CORVUtils::ProcessRunner rm("/bin/rm", {"-rf", registry});
-        PMSRunLogged(info, type, rm);
-    }
-    if (!ExLock(180)) {
-        CORV_LOG_ERR("Failed to lock, %s", info.package.c_str());
-        setResult(PKG_ERR_LOCKED);
-        goto final;
-    }
-    // 18. A preinst may have damaged the INFO it was unpacked with.
-    if (!PMSInfoFileUsable(workDir)) {
-        if (!PMSLoadPKGInfoFile(workDir, info, nullptr, kInstallInfoMask)) {
-            CORV_LOG_ERR("Failed to validate package INFO in %s", workDir.c_str());
-            PMSRunLogged(info, type, cmd.repairExtract);
-            if (!PMSLoadPKGInfoFile(workDir, info, nullptr, kInstallInfoMask)) {
-                CORV_LOG_ERR("Failed to validate package INFO");
-                setResult(PKG_ERR_BAD_ARCHIVE);
-                goto final;
-            }
-        }
-    }
-    // 19.
-    if (PKG_ERRCODE icons = PMSFoldIcons(workDir, info.package); icons != PKG_OK) {
-        setResult(icons);
-        goto final;
-    }
-    // 20.
-    if (!registerPackage(type, info, workDir, target)) {
-        CORV_LOG_ERR("Failed to register package for %s", info.package.c_str());
-        setResult(PKG_ERR_SYSTEM);
-        goto final;
-    }
-    // 21. postinst still runs: the package is there and may need its own cleanup.
-    if (!Resource::Acquire(Resource::TIMING_POSTINST, info, type, resp, extra, "")) {
-        postinstAcquireFailed = true;
-        CORV_LOG_ERR("Failed to acquire resource after install %s [0x%04X %s:%d]",
-                     info.package.c_str(), VLIBCErrGet(), VLIBCErrorGetFile(), VLIBCErrorGetLine());
-        insertJsonParam("worker_msg", resp.GetErrJsonArray());
-    }
-    // 22-24.
-    denyGuestAccess(info);
-    // 25.
-    restartMask = info.instuninst_restart_services;
-    // 26.
-    if (PMSCheckIsExec(registry + "/scripts/postinst")) {
-        int ret = PMSRunInstallScript(info, registry + "/scripts/postinst", "postinst", type, ctx,
-                                      true, "");
-        if (ret != 0) {
-            if (ret != kScriptIdentityFailed) {
-                CORV_LOG_ERR("Failed to run postinst script for %s, %d", info.package.c_str(), ret);
-            }
-            setResult(PKG_ERR_SYSTEM);
-            goto restart;
-        }
-    }
-    // 27. The registry keeps `installing`: the package shows as broken until repaired.
-    if (postinstAcquireFailed) {
-        setResult(PKG_ERR_INSTALL_FAILED);
-        goto restart;
-    }
-    // 28.
-    post_install(info);
-    unlink(progressPath.c_str());
-    unlink((registry + "/installing").c_str());
-    outcome = 1;
-    if (startAfterInstall || !info.startable) {
-        std::vector<std::string> order;
-        if (!getDependencyOrder(info.package.c_str(), order, false)) {
-            order = {info.package};
-        }
-        restartMask |= findRestartServices(order);
-        const std::string name = info.package;
-        serviceControl(type, name, true, language, userName, nullptr, true, false);
-    }
-restart:
-    // 29.
-    if (restartMask != 0) {
-        RestartServicesAction(restartMask);
-    }
-final:
-    // 30.
-    if (getResult() != PKG_ERR_LOCKED && VLIBCFileCheckDir(workDir.c_str())) {
-        PMSRunLogged(info, type, cmd.removeWorkDir);
-    }
-    PMSWriteSysLogf("%s %s %s %s", "install", info.package.c_str(), info.version.c_str(),
-                    outcome ? "successfully" : "failed");
-    PMSCheckServiesStatus(info, nullptr, type, -1);
-    return outcome;
+    PMSRunClosingSteps("install", r, kInstallClosingSteps);
+    return r.outcome;
 }
 
 bool PackageManager::post_install(const PackageInfo& info) {

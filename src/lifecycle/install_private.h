@@ -27,13 +27,17 @@ struct InstallCommands {
     CORVUtils::ProcessRunner extractPayload;
 };
 
-// The first steps of an installation and of an upgrade: lock, unpack the package file
-// into `workDir`, read and check its INFO into `info` (architecture, version limits,
-// the payload archive). False with the result set on `pm` (logged). `nameTheDir`: the log
-// line of an unreadable INFO names the work directory (the installation's wording).
-bool PMSUnpackAndCheck(PackageManager& pm, PKG_INSTALLATION_TYPE type, InstallCommands& cmd,
-                       const std::string& cpkPath, const std::string& workDir, PackageInfo& info,
-                       bool nameTheDir);
+// The INFO fields an installation reads: all but the icons, which are folded in later.
+constexpr unsigned long long kInstallInfoMask = 0xFFFFFFFFF7FFFFFFULL;
+
+// The first steps of an installation and of an upgrade, named as steps of `road`: lock,
+// unpack the package file into `workDir`, read and check its INFO into `info`
+// (architecture, version limits, the payload archive). False with the result set on `pm`
+// (logged). `nameTheDir`: the log line of an unreadable INFO names the work directory (the
+// installation's wording).
+bool PMSUnpackAndCheck(const char* road, PackageManager& pm, PKG_INSTALLATION_TYPE type,
+                       InstallCommands& cmd, const std::string& cpkPath, const std::string& workDir,
+                       PackageInfo& info, bool nameTheDir);
 
 // What the install scripts of one operation share.
 struct ScriptContext {

@@ -12,12 +12,13 @@ const char* PMSStatusWord(int type);
 #include <string>
 #include <vector>
 
+#include "common/registry_paths.h"
+
 namespace CORVPackageTool {
 
-// /var/packages/<name>, and the package's settings directory /usr/corv/etc/packages/<name>.
 // PMSWriteSysLog of a printf-style line, cut at 4095 bytes.
 void PMSWriteSysLogf(const char* format, ...) __attribute__((format(printf, 1, 2)));
-std::string PMSRegistryDir(const std::string& name);
+// The package's settings directory /usr/corv/etc/packages/<name>.
 std::string PMSPackageEtcDir(const std::string& name);
 // The registry's `target` link leads to a directory on a volume that has not failed.
 bool PMSCheckPayloadTarget(const std::string& registry);
@@ -55,8 +56,6 @@ void PMSRemoveTask(NOS::Task* task);
 int ServiceControlStep(const PackageInfo& info, const std::string& job, bool start,
                        PKG_INSTALLATION_TYPE type, const char* language, const char* userName);
 
-// /var/packages/<name>/enabled: the user's intent that the package runs.
-std::string PMSEnabledFlagPath(const std::string& name);
 // Runs the desktop notifier with `args` after its fixed leading arguments; failures are
 // logged only.
 void PMSNotifyAdministrators(const std::vector<std::string>& args);

@@ -108,10 +108,8 @@ void PMSPrepareScriptEnv(const PackageInfo& info, CORVUtils::ProcessRunner& runn
                          PKG_INSTALLATION_TYPE type, const Json::Value* extra, const char* volume,
                          const char* cpkFile, const char* userName) {
     EnvSink env(&runner);
-    // 1.
     env.set("CORVPKG_PKGNAME", info.package);
     env.set("CORVPKG_PKGVER", info.version);
-    // 2.
     if (type == PKG_INSTALL || type == PKG_UPGRADE) {
         env.set("CORVPKG_PKG_PROGRESS_PATH", PMSGetProgressPath(info.package));
     } else {
@@ -123,11 +121,12 @@ void PMSPrepareScriptEnv(const PackageInfo& info, CORVUtils::ProcessRunner& runn
     } else {
         env.unset("CORVPKG_TEMP_UPGRADE_FOLDER");
     }
-    // 3, 4, 5 (without the last three, which only scripts get).
+    // The language, versions, architecture, target and port; the user name and the message
+    // file are for scripts only.
     prepareCommon(env, info, language, volume, cpkFile);
     env.setOrUnset("CORVPKG_USERNAME", userName);
     env.setOrUnset("CORVPKG_TEMP_LOGFILE", logFile ? logFile->c_str() : nullptr);
-    // 6. The previous run's extra variables go first, whatever this run brings.
+    // The previous run's extra variables go first, whatever this run brings.
     unsetMemo();
     if (extra == nullptr) {
         return;

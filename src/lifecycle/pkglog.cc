@@ -13,6 +13,7 @@
 #include <string>
 
 #include "common/regular_file.h"
+#include "corv/handles.h"
 #include "corv/log.h"
 #include "corv/vlibc.h"
 #include "corvpkg/pkglog.h"
@@ -50,12 +51,10 @@ void PMSWriteSysLog(const char* message) {
     if (localtime_r(&now, &local) != nullptr) {
         strftime(stamp, sizeof(stamp), "%Y/%m/%d %H:%M:%S", &local);
     }
-    FILE* log = fopen(PKG_OPERATIONS_LOG, "ae");
-    if (log == nullptr) {
-        return;
+    CORVUniqueFile log{fopen(PKG_OPERATIONS_LOG, "ae")};
+    if (log) {
+        fprintf(log.get(), "%s\t%s\n", stamp, message);
     }
-    fprintf(log, "%s\t%s\n", stamp, message);
-    fclose(log);
 }
 
 void PMSWriteSysLogf(const char* format, ...) {
@@ -69,23 +68,20 @@ void PMSWriteSysLogf(const char* format, ...) {
 
 int PMSRunAndWriteScriptLog(const PackageInfo& info, PKG_INSTALLATION_TYPE type,
                             CORVUtils::ProcessRunner& runner, int mode) {
-    // 1.
     const std::string command = runner.toString();
     char line[kLogLineSize];
     snprintf(line, sizeof(line), "%s %s %s Begin %s", parseInstallTypeToStr(type),
              info.package.c_str(), info.version.c_str(), command.c_str());
     PMSWriteSysLog(line);
-    // 2. A log that cannot be opened does not stop the script.
+    // A log that cannot be opened does not stop the script.
     int fd = open(PKG_OPERATIONS_LOG, O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC, 0644);
     if (fd < 0) {
         CORV_LOG_ERR("Failed to open /var/log/corvpkg.log, %m");
     }
-    // 3.
     int ret = runner.run(mode == -1 ? 1 : mode, true, true, fd);
     if (fd >= 0) {
         close(fd);
     }
-    // 4.
     snprintf(line, sizeof(line), "%s %s %s End %s ret=[%d]", parseInstallTypeToStr(type),
              info.package.c_str(), info.version.c_str(), command.c_str(), ret);
     PMSWriteSysLog(line);
@@ -108,42 +104,38 @@ std::string PMSReadPackageLog(const std::string& path) {
 }
 
 double PMSGetProgress(const std::string& name) {
-    // 1. No file, no lock to wait for.
+    // No file, no lock to wait for.
     const std::string path = PMSGetProgressPath(name);
     if (access(path.c_str(), F_OK) != 0) {
         return -1.0;
     }
-    // 2. The script writes under the same lock.
+    // The script writes under the same lock.
     double progress = -1.0;
     int fd = -1;
     if (VLIBCFileLockTimeByFile(path.c_str(), 0, 60, &fd) != 0) {
         CORV_LOG_ERR("Failed to Lock file, %s, %m", path.c_str());
     } else {
-        // 3.
         char buf[kProgressSize] = "";
         if (VLIBCRead(fd, buf, sizeof(buf) - 1) != -1) {
             progress = strtod(buf, nullptr);
         }
     }
-    // 4.
     VLIBCFileUnlockByFile(fd);
     return progress;
 }
 
 int PMSCheckServiesStatus(const PackageInfo& info, const PackageInfo* oldInfo,
                           PKG_INSTALLATION_TYPE type, int startFlag) {
-    // 1.
     unsetenv("CORVPKG_BOOT_STATUS");
     if (access(PKG_HOOKS_DIR, F_OK) != 0) {
         unsetHookVariables();
         return 1;
     }
-    DIR* dir = opendir(PKG_HOOKS_DIR);
-    if (dir == nullptr) {
+    CORVUniqueDir dir{opendir(PKG_HOOKS_DIR)};
+    if (!dir) {
         unsetHookVariables();
         return 0;
     }
-    // 2.
     if (type == 0) {
         setenv("CORVPKG_BOOT_STATUS", startFlag == 1 ? "UPSTART" : "SHUTDOWN", 1);
     } else if (const char* word = PMSStatusWord(type)) {
@@ -151,13 +143,11 @@ int PMSCheckServiesStatus(const PackageInfo& info, const PackageInfo* oldInfo,
     } else {
         unsetenv("CORVPKG_PKG_STATUS");
     }
-    // 3.
     if (startFlag == 1) {
         setenv("CORVPKG_PKG_STATUS", "START", 1);
     } else if (startFlag == 0) {
         setenv("CORVPKG_PKG_STATUS", "STOP", 1);
     }
-    // 4.
     setenv("CORVPKG_PKGNAME", info.package.c_str(), 1);
     setenv("CORVPKG_PKGVER", info.version.c_str(), 1);
     if (oldInfo != nullptr) {
@@ -165,8 +155,8 @@ int PMSCheckServiesStatus(const PackageInfo& info, const PackageInfo* oldInfo,
     } else {
         unsetenv("CORVPKG_OLD_PKGVER");
     }
-    // 5. Links count only when they lead to a regular file.
-    while (struct dirent* entry = readdir(dir)) {
+    // Links count only when they lead to a regular file.
+    while (struct dirent* entry = readdir(dir.get())) {
         if (strcmp(entry->d_name, ".") == 0 || strcmp(entry->d_name, "..") == 0) {
             continue;
         }
@@ -181,9 +171,7 @@ int PMSCheckServiesStatus(const PackageInfo& info, const PackageInfo* oldInfo,
             VLIBCExecv(path, nullptr, 1);
         }
     }
-    // 6.
     unsetHookVariables();
-    closedir(dir);
     return 1;
 }
 

@@ -35,9 +35,6 @@ bool runLogged(const PackageInfo& info, PKG_INSTALLATION_TYPE type,
 
 }  // namespace
 
-std::string PMSRegistryDir(const std::string& name) {
-    return "/var/packages/" + name;
-}
 std::string PMSPackageEtcDir(const std::string& name) {
     return "/usr/corv/etc/packages/" + name;
 }
@@ -61,7 +58,6 @@ bool PMSCheckPayloadTarget(const std::string& registry) {
 bool PackageManager::registerPackage(PKG_INSTALLATION_TYPE type, PackageInfo& info,
                                      const std::string& workDir, const std::string& target) {
     const std::string registry = PMSRegistryDir(info.package);
-    // 1.
     CORVUtils::ProcessRunner mkdirRegistry("/bin/mkdir", {"-p", registry});
     CORVUtils::ProcessRunner mvInfo("/bin/mv", {"-f", workDir + "/INFO", registry + "/INFO"});
     CORVUtils::ProcessRunner rmScripts("/bin/rm", {"-rf", registry + "/scripts"});
@@ -73,7 +69,7 @@ bool PackageManager::registerPackage(PKG_INSTALLATION_TYPE type, PackageInfo& in
     CORVUtils::ProcessRunner rmConf("/bin/rm", {"-rf", registry + "/conf"});
     CORVUtils::ProcessRunner mvConf("/bin/mv", {"-f", workDir + "/conf", registry + "/conf"});
 
-    // 2. Nothing has changed yet if the INFO is bad.
+    // Nothing has changed yet if the INFO is bad.
     PackageInfo local;
     bool ok = true;
     bool outcome = false;
@@ -81,7 +77,7 @@ bool PackageManager::registerPackage(PKG_INSTALLATION_TYPE type, PackageInfo& in
         CORV_LOG_ERR("Failed to validate package INFO");
         setResult(PKG_ERR_BAD_ARCHIVE);
     } else {
-        // 3, 4. The flag goes in right after the directory, before anything can fail
+        // The flag goes in right after the directory, before anything can fail
         // half-way, so that an interrupted registration always shows as broken.
         ok &= runLogged(local, type, mkdirRegistry);
         const std::string flag = registry + "/installing";
@@ -94,12 +90,10 @@ bool PackageManager::registerPackage(PKG_INSTALLATION_TYPE type, PackageInfo& in
         ok &= runLogged(local, type, mvInfo);
         ok &= runLogged(local, type, rmScripts);
         ok &= runLogged(local, type, mvScripts);
-        // 5.
         if (VLIBCFileCheckDir((workDir + "/WIZARD_UIFILES").c_str())) {
             PMSRunAndWriteScriptLog(local, type, rmWizard, -1);
             ok &= runLogged(local, type, mvWizard);
         }
-        // 6, 7.
         bool confMoved = true;
         if (VLIBCFileCheckDir((workDir + "/conf").c_str())) {
             PMSRunAndWriteScriptLog(local, type, rmConf, -1);
@@ -123,7 +117,7 @@ bool PackageManager::registerPackage(PKG_INSTALLATION_TYPE type, PackageInfo& in
             }
             ok = linked;
         }
-        // 8. Settings survive upgrades and normal uninstalls, so they live apart.
+        // Settings survive upgrades and normal uninstalls, so they live apart.
         const std::string etcDir = PMSPackageEtcDir(local.package);
         if (!VLIBCFileCheckDir(etcDir.c_str())) {
             CORVFSMkdirP("/usr/corv/etc/packages", nullptr, 1, -1, -1, 0755);
@@ -143,14 +137,13 @@ bool PackageManager::registerPackage(PKG_INSTALLATION_TYPE type, PackageInfo& in
                 CORV_LOG_ERR("Failed to chown %s (%m)", etcDir.c_str());
             }
         }
-        // 9.
         if (ok) {
             const std::string etcLink = registry + "/etc";
             unlink(etcLink.c_str());
             outcome = symlink(etcDir.c_str(), etcLink.c_str()) == 0;
         }
     }
-    // 10. The data must reach the disk even if the caller is killed right after.
+    // The data must reach the disk even if the caller is killed right after.
     pid_t child = VLIBCProcFork();
     if (child == 0) {
         sleep(1);
@@ -162,31 +155,27 @@ bool PackageManager::registerPackage(PKG_INSTALLATION_TYPE type, PackageInfo& in
 
 std::string PackageManager::getServiceScript(const std::string& name, PackageInfo& info) {
     const std::string registry = PMSRegistryDir(name);
-    // 1.
     if (access(registry.c_str(), F_OK) != 0 || access((registry + "/INFO").c_str(), F_OK) != 0) {
         setResult(PKG_ERR_NOT_INSTALLED);
         return "";
     }
-    // 2. The target is checked around the read, since a volume can fail in between.
+    // The target is checked around the read, since a volume can fail in between.
     if (!PMSCheckPayloadTarget(registry) ||
         !PMSLoadPKGInfoFile(registry, info, nullptr, PKG_INFO_MASK_ALL) ||
         !PMSCheckPayloadTarget(registry)) {
         setResult(PKG_ERR_BROKEN);
         return "";
     }
-    // 3.
     const std::string script = registry + "/scripts/start-stop-status";
     if (access(script.c_str(), F_OK) != 0) {
         setResult(PKG_ERR_NO_STATUS_SCRIPT);
         return "";
     }
-    // 4.
     if (!PMSCheckIsExec(script)) {
         CORV_LOG_ERR("%s can't run", script.c_str());
         setResult(PKG_ERR_BROKEN);
         return "";
     }
-    // 5.
     return script;
 }
 

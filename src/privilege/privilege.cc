@@ -130,12 +130,11 @@ std::string GetUserName(const std::string& name, const std::string& dir) {
 
 bool SetIdentity(CORVUtils::ProcessRunner& runner, const std::string& name,
                  const std::string& action, const std::string& dir) {
-    // 1.
     if (name.empty()) {
         VLIBCErrSet(ERR_BAD_PARAMETERS);
         return false;
     }
-    // 2, 3. No file: the script runs as root.
+    // No file: the script runs as root.
     Json::Value conf;
     bool found = false;
     std::string path;
@@ -145,16 +144,13 @@ bool SetIdentity(CORVUtils::ProcessRunner& runner, const std::string& name,
     if (!found) {
         return true;
     }
-    // 4.
     CtrlScriptWalker walker(action);
     if (!TraversePrivilege(conf, "ctrl-script", walker)) {
         CORV_LOG_ERR("Failed to traverse %s [0x%04X %s:%d]", path.c_str(), VLIBCErrGet(),
                      VLIBCErrorGetFile(), VLIBCErrorGetLine());
         return false;
     }
-    // 5.
     int identity = walker.identity != IDENTITY_INVALID ? walker.identity : GetDefaultIdentity(conf);
-    // 6.
     // A script meant for the package's user must never fall back to root, so an identity
     // that cannot be resolved is a failure.
     const std::string user = userOf(conf, name);

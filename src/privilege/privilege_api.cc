@@ -16,12 +16,11 @@ namespace CORVPackageTool {
 namespace Privilege {
 
 std::string GetTmpFolderPath(const std::string& name, const char* volume) {
-    // 1.
     if (name.empty()) {
         VLIBCErrSet(ERR_BAD_PARAMETERS);
         return "";
     }
-    // 2. The volume is what the target link holds before its second "/".
+    // The volume is what the target link holds before its second "/".
     std::string vol;
     if (volume != nullptr) {
         vol = volume;
@@ -29,7 +28,6 @@ std::string GetTmpFolderPath(const std::string& name, const char* volume) {
         std::string target = PMSReadLink("/var/packages/" + name + "/target");
         vol = target.substr(0, target.find('/', 1));
     }
-    // 3.
     if (vol.compare(0, 7, "/volume") == 0 || vol.compare(0, 19, PKG_SYSTEM_INSTALL_PATH) == 0) {
         return vol + "/@tmp/corvpkg.tmp/" + name;
     }
@@ -37,12 +35,11 @@ std::string GetTmpFolderPath(const std::string& name, const char* volume) {
 }
 
 bool CreateTmpFolder(const std::string& name, const std::string& path) {
-    // 1.
     if (name.empty() || path.empty()) {
         VLIBCErrSet(ERR_BAD_PARAMETERS);
         return false;
     }
-    // 2, 3. A package without privilege file is root's.
+    // A package without privilege file is root's.
     uid_t uid = 0;
     gid_t gid = 0;
     std::string user = GetUserName(name, "");
@@ -57,13 +54,11 @@ bool CreateTmpFolder(const std::string& name, const std::string& path) {
                      VLIBCErrorGetFile(), VLIBCErrorGetLine());
         return false;
     }
-    // 4.
     if (CORVFSMkdirP(path.c_str(), nullptr, 1, 0, 0, 0700) < 0) {
         CORV_LOG_ERR("Failed to create %s [0x%04X %s:%d]", path.c_str(), VLIBCErrGet(),
                      VLIBCErrorGetFile(), VLIBCErrorGetLine());
         return false;
     }
-    // 5.
     if (chown(path.c_str(), uid, gid) != 0) {
         CORV_LOG_ERR("Failed to chown %s (%m)", path.c_str());
         return false;

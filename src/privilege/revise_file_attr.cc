@@ -7,6 +7,7 @@
 
 #include <string>
 
+#include "common/registry_paths.h"
 #include "common/unique_fd.h"
 #include "corv/log.h"
 #include "corv/pkgutils.h"
@@ -128,18 +129,15 @@ ExeWalker::ExeWalker(const std::string& top, unsigned pkgUid, unsigned pkgGid)
 ExeWalker::~ExeWalker() = default;
 
 int ExeWalker::walk(const Json::Value& entry) {
-    // 1.
     if (!entry["relpath"].isString() || !entry["run-as"].isString()) {
         VLIBCErrSet(ERR_MALFORMED);
         return 0;
     }
-    // 2, 3.
     struct stat st {};
     UniqueFd fd = openEntryFile(topDir, entry["relpath"].asString(), st);
     if (!fd) {
         return 0;
     }
-    // 4.
     uid_t owner = 0;
     gid_t group = 0;
     switch (TranslateIdentity(entry["run-as"].asString())) {
@@ -161,7 +159,6 @@ int ExeWalker::walk(const Json::Value& entry) {
         VLIBCErrSet(ERR_CHOWN_FAILED);
         return 0;
     }
-    // 5.
     return 2;
 }
 
@@ -170,20 +167,17 @@ ToolWalker::ToolWalker(const std::string& top, unsigned pkgUid, unsigned pkgGid)
 ToolWalker::~ToolWalker() = default;
 
 int ToolWalker::walk(const Json::Value& entry) {
-    // 1.
     if (!entry["relpath"].isString() || !entry["user"].isString() || !entry["group"].isString() ||
         !entry["permission"].isString()) {
         VLIBCErrSet(ERR_MALFORMED);
         return 0;
     }
-    // 2.
     const std::string relpath = entry["relpath"].asString();
     struct stat st {};
     UniqueFd fd = openEntryFile(topDir, relpath, st);
     if (!fd) {
         return 0;
     }
-    // 3, 4.
     unsigned owner = 0;
     unsigned group = 0;
     const std::string permission = entry["permission"].asString();
@@ -203,7 +197,6 @@ int ToolWalker::walk(const Json::Value& entry) {
         VLIBCErrSet(ERR_CHOWN_FAILED);
         ok = false;
     }
-    // 5.
     if (!ok) {
         CORV_LOG_ERR("Failed to revise %s [0x%04X %s:%d]", relpath.c_str(), VLIBCErrGet(),
                      VLIBCErrorGetFile(), VLIBCErrorGetLine());
@@ -225,13 +218,10 @@ bool ClearSetUGidBit(const std::string& path) {
     return true;
 }
 
-bool ReviseFileAttr(const std::string& name, const std::string& dir) {
-    // 1.
-    if (name.empty()) {
-        VLIBCErrSet(ERR_BAD_PARAMETERS);
-        return false;
-    }
-    // 2. A set-id script would run with its owner's rights whoever starts it.
+namespace {
+
+// A set-id script would run with its owner's rights whoever starts it.
+bool clearScriptSetIds(const std::string& name, const std::string& dir) {
     for (const char* script : kScripts) {
         const std::string path = dir + "/scripts/" + script;
         if (VLIBCFileExist(path.c_str()) && !ClearSetUGidBit(path)) {
@@ -240,21 +230,12 @@ bool ReviseFileAttr(const std::string& name, const std::string& dir) {
             return false;
         }
     }
-    // 3.
-    std::string confPath;
-    if (!GetConfPathFrom(dir, confPath)) {
-        return true;
-    }
-    // 4.
-    Json::Value conf;
-    if (!fromFile(confPath, conf)) {
-        CORV_LOG_ERR("Failed to read %s (%m)", confPath.c_str());
-        VLIBCErrSet(ERR_READ_FAILED);
-        return false;
-    }
-    // 5, 6. A package must never take over an account of the system.
-    const std::string user = stringOr(conf, "username", name);
-    // An account that does not exist yet has no id: only its name can be reserved.
+    return true;
+}
+
+// A package must never take over an account of the system. An account that does not
+// exist yet has no id: only its name can be reserved.
+bool refuseSystemAccounts(const std::string& user, const std::string& group) {
     uid_t uid = kNoId;
     gid_t gid = kNoId;
     if (CORVUserGetUGID(user.c_str(), &uid, nullptr) < 0 && VLIBCErrGet() != ERR_NO_SUCH_USER) {
@@ -266,8 +247,6 @@ bool ReviseFileAttr(const std::string& name, const std::string& dir) {
         CORV_LOG_ERR("User %s is reservered for system", user.c_str());
         return false;
     }
-    // 7, 8.
-    const std::string group = stringOr(conf, "groupname", name);
     if (CORVGroupGetGID(group.c_str(), &gid) < 0 && VLIBCErrGet() != ERR_NO_SUCH_GROUP) {
         CORV_LOG_ERR("Failed to check groupr %s [0x%04X %s:%d]", group.c_str(), VLIBCErrGet(),
                      VLIBCErrorGetFile(), VLIBCErrorGetLine());
@@ -277,27 +256,13 @@ bool ReviseFileAttr(const std::string& name, const std::string& dir) {
         CORV_LOG_ERR("Group %s is reservered for system", group.c_str());
         return false;
     }
-    // 9.
-    const std::string home = "/var/packages/" + name + "/target";
-    if (CORVLocalAccountUserPrepareForPkg(user.c_str(), group.c_str(), home.c_str()) < 0) {
-        CORV_LOG_ERR("Failed to prepare user for %s [0x%04X %s:%d]", name.c_str(), VLIBCErrGet(),
-                     VLIBCErrorGetFile(), VLIBCErrorGetLine());
-        return false;
-    }
-    // 10.
-    if (CORVUserGetUGID(user.c_str(), &uid, &gid) < 0) {
-        CORV_LOG_ERR("Failed to get %s [0x%04X %s:%d]", user.c_str(), VLIBCErrGet(),
-                     VLIBCErrorGetFile(), VLIBCErrorGetLine());
-        return false;
-    }
-    // 11.
-    const std::string join = stringOr(conf, "join-groupname", "");
-    if (!join.empty() && !joinGroup(user, join)) {
-        CORV_LOG_ERR("Failed to add package user '%s' to group '%s'", user.c_str(), join.c_str());
-        return false;
-    }
-    // 12.
-    const std::string payload = dir + "/package";
+    return true;
+}
+
+// The payload's default owner from conf/privilege: the package's user with its own group
+// or with the system group.
+bool setDefaultOwner(const std::string& name, const Json::Value& conf, const std::string& user,
+                     const std::string& group, const std::string& payload) {
     std::string owner;
     int identity = GetDefaultIdentity(conf);
     if (identity == IDENTITY_PACKAGE) {
@@ -317,7 +282,56 @@ bool ReviseFileAttr(const std::string& name, const std::string& dir) {
                      VLIBCErrGet(), VLIBCErrorGetFile(), VLIBCErrorGetLine());
         return false;
     }
-    // 13.
+    return true;
+}
+
+}  // namespace
+
+bool ReviseFileAttr(const std::string& name, const std::string& dir) {
+    if (name.empty()) {
+        VLIBCErrSet(ERR_BAD_PARAMETERS);
+        return false;
+    }
+    if (!clearScriptSetIds(name, dir)) {
+        return false;
+    }
+    std::string confPath;
+    if (!GetConfPathFrom(dir, confPath)) {
+        return true;
+    }
+    Json::Value conf;
+    if (!fromFile(confPath, conf)) {
+        CORV_LOG_ERR("Failed to read %s (%m)", confPath.c_str());
+        VLIBCErrSet(ERR_READ_FAILED);
+        return false;
+    }
+    const std::string user = stringOr(conf, "username", name);
+    const std::string group = stringOr(conf, "groupname", name);
+    if (!refuseSystemAccounts(user, group)) {
+        return false;
+    }
+    uid_t uid = kNoId;
+    gid_t gid = kNoId;
+    const std::string home = PMSRegistryEntry(name, kRegistryTarget);
+    if (CORVLocalAccountUserPrepareForPkg(user.c_str(), group.c_str(), home.c_str()) < 0) {
+        CORV_LOG_ERR("Failed to prepare user for %s [0x%04X %s:%d]", name.c_str(), VLIBCErrGet(),
+                     VLIBCErrorGetFile(), VLIBCErrorGetLine());
+        return false;
+    }
+    if (CORVUserGetUGID(user.c_str(), &uid, &gid) < 0) {
+        CORV_LOG_ERR("Failed to get %s [0x%04X %s:%d]", user.c_str(), VLIBCErrGet(),
+                     VLIBCErrorGetFile(), VLIBCErrorGetLine());
+        return false;
+    }
+    const std::string join = stringOr(conf, "join-groupname", "");
+    if (!join.empty() && !joinGroup(user, join)) {
+        CORV_LOG_ERR("Failed to add package user '%s' to group '%s'", user.c_str(), join.c_str());
+        return false;
+    }
+    const std::string payload = dir + "/package";
+    if (!setDefaultOwner(name, conf, user, group, payload)) {
+        return false;
+    }
     ExeWalker exe(payload, uid, gid);
     ToolWalker tool(payload, uid, gid);
     if (!TraversePrivilege(conf, "executable", exe) || !TraversePrivilege(conf, "tool", tool)) {
@@ -325,7 +339,6 @@ bool ReviseFileAttr(const std::string& name, const std::string& dir) {
                      VLIBCErrorGetFile(), VLIBCErrorGetLine());
         return false;
     }
-    // 14.
     return true;
 }
 

@@ -7,6 +7,7 @@
 
 #include <string>
 
+#include "corv/file_replace.h"
 #include "corv/log.h"
 #include "corv/vlibc.h"
 #include "corvpkg/json_util.h"
@@ -96,8 +97,9 @@ bool ReadJsonFile(const std::string& path, Json::Value& out) {
     return true;
 }
 
+// Created with its final mode: an own-file is never readable by others, not for a moment.
 bool WriteJsonFile(const std::string& path, const Json::Value& value) {
-    if (!toFile(value, path)) {
+    if (!CORVFileReplace(path, toString(value), 0600)) {
         CORV_LOG_ERR("Failed to write %s (%m)", path.c_str());
         VLIBCErrSet(ERR_WRITE_FAILED);
         return false;

@@ -74,10 +74,10 @@ bool PMSCORVCrondSet(CORVSCHEDULE* schedule) {
         return false;
     }
 
-    // 1. The days of the week flag.
+    // The days of the week flag.
     const std::string days = DayList(schedule->week);
 
-    // 2. The job, with hour and minute left to the scheduler.
+    // The job, with hour and minute left to the scheduler.
     Json::Value job(Json::objectValue);
     job["name"] = kJobName;
     job["cmd"] = std::string(schedule->cmd, strnlen(schedule->cmd, sizeof schedule->cmd));
@@ -88,7 +88,7 @@ bool PMSCORVCrondSet(CORVSCHEDULE* schedule) {
     job["expire_action"] = "skip";
     job["assure_execute"] = 168;
 
-    // 3. Hand it to the scheduler.
+    // Hand it to the scheduler.
     if (!manager.Save(job)) {
         CORV_LOG_ERR("Failed to write config: autopkgupgrade");
         return false;
@@ -101,21 +101,21 @@ bool PMSCORVCrondRemove() {
 }
 
 bool PMSSavaSchedule(int nosNotify, int emailNotify, int autoUpdate) {
-    // 1. The notifications in effect.
+    // The notifications in effect.
     const bool nosOn = ResolveSetting(nosNotify, kKeyNosNotify);
     const bool emailOn = ResolveSetting(emailNotify, kKeyEmailNotify);
 
-    // 2. Whether anything needs the job.
+    // Whether anything needs the job.
     const bool wanted =
         (autoUpdate == -1 && InfoIsYes(kKeyAutoUpdate)) || nosOn || emailOn || autoUpdate == 1;
 
-    // 3. No job without a use for it.
+    // No job without a use for it.
     if (!wanted && !PMSCORVCrondRemove()) {
         CORV_LOG_ERR("Failed to remove auto update schedule.");
         return false;
     }
 
-    // 4. One of two weekly patterns, so that devices spread over the days.
+    // One of two weekly patterns, so that devices spread over the days.
     if (wanted) {
         srandom(time(nullptr));
         CORVSCHEDULE schedule;
@@ -128,7 +128,7 @@ bool PMSSavaSchedule(int nosNotify, int emailNotify, int autoUpdate) {
         }
     }
 
-    // 5. The settings that were given.
+    // The settings that were given.
     if (nosNotify != -1 &&
         VLIBCINFOSetKeyValue(kKeyNosNotify, nosNotify == 1 ? "yes" : "no") != 0) {
         CORV_LOG_ERR("Failed to set upgrade_pkg_nos_notification in corvinfo.conf.");

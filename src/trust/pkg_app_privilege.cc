@@ -68,9 +68,7 @@ void grantToAdministrators(const std::string& app) {
 // The administrators' groups get `app`; with the grant "all" also those of the LDAP
 // server and of the Windows domain.
 void grantToGroups(const std::string& app, const std::string& grant) {
-    // 1.
     VLIBAppPrivGroupAddOne(kAdministrators, app.c_str());
-    // 2.
     if (grant != "all") {
         return;
     }
@@ -100,11 +98,9 @@ void grantToGroups(const std::string& app, const std::string& grant) {
 }  // namespace
 
 void PMSSetAppPrivilege(const char* user, const std::string& appNames, const char* language) {
-    // 1.
     if (appNames.empty() || language == nullptr) {
         return;
     }
-    // 2.
     CORV::NDS::JSConfigParser parser(language);
     if (!parser.Parse(NULL)) {
         CORV_LOG_ERR("Failed to parse the desktop configuration [0x%04X %s:%d]", VLIBCErrGet(),
@@ -114,7 +110,6 @@ void PMSSetAppPrivilege(const char* user, const std::string& appNames, const cha
     const Json::Value configs = parser.GetJSConfigs();
     const std::vector<std::string> units = configs.getMemberNames();
 
-    // 3.
     std::vector<std::string> configable;
     std::vector<std::string> grants;
     std::vector<std::string> advanced;
@@ -128,33 +123,27 @@ void PMSSetAppPrivilege(const char* user, const std::string& appNames, const cha
             if (entry == nullptr) {
                 continue;
             }
-            // 3.1.
             if (!entry->isMember(kConfigablePrivilege) || isTrue(*entry, kConfigablePrivilege)) {
                 configable.emplace_back(app);
                 grants.push_back((*entry)[kGrantPrivilege].asString());
             }
-            // 3.2.
             if (isTrue(*entry, kAdvanceGrantPrivilege)) {
                 advanced.emplace_back(app);
             }
-            // 3.3.
             break;
         }
     }
 
-    // 4.
     if (configable.empty()) {
         return;
     }
 
-    // 5.
     if (user != nullptr && !isBuiltinAccount(user) && VLIBGroupIsAdminGroupMem(user, 0) == 1) {
         for (const std::string& app : configable) {
             VLIBAppPrivUserAddOne(user, app.c_str());
         }
     }
 
-    // 6.
     for (size_t i = 0; i < configable.size(); ++i) {
         const std::string& app = configable[i];
         if (std::find(advanced.begin(), advanced.end(), app) == advanced.end()) {

@@ -27,14 +27,12 @@ bool strictlyBetween(const std::string& a, const char* x, const std::string& b) 
 }  // namespace
 
 bool PMSVersionNotLess(const char* a, const char* b) {
-    // 1.
     std::string normA;
     std::string normB;
     if (!NormalizeVersion(a, b, normA) || !NormalizeVersion(b, a, normB)) {
         CORV_LOG_ERR("Failed to NormalizeVersion().");
         return false;
     }
-    // 2.
     SzList piecesA(kPieceCapacity);
     SzList piecesB(kPieceCapacity);
     if (!piecesA || !piecesB) {
@@ -48,7 +46,6 @@ bool PMSVersionNotLess(const char* a, const char* b) {
                      VLIBCErrorGetLine());
         return false;
     }
-    // 3.
     const int n = std::max(VLIBCSzListCount(piecesA.get()), VLIBCSzListCount(piecesB.get()));
     for (int i = 0; i < n; ++i) {
         const char* pa = VLIBCSzListGet(piecesA.get(), i);
@@ -63,13 +60,11 @@ bool PMSVersionNotLess(const char* a, const char* b) {
 }
 
 int PMSThirdPartyCheckLimit(const char* packageName, const char* version, std::string& limit) {
-    // 1.
     if (packageName == nullptr || version == nullptr) {
         CORV_LOG_ERR("Invaild Argument (%s)=[%d]\n", "NULL == packageName || NULL == version", 1);
         VLIBCErrSet(ERR_BAD_PARAMETERS);
         return -1;
     }
-    // 2.
     char value[kLimitValueSize] = "";
     int n = VLIBCFileGetKeyValue(PKG_LIMIT_CONF, packageName, value, sizeof(value), 0);
     if (n < 0) {
@@ -79,7 +74,6 @@ int PMSThirdPartyCheckLimit(const char* packageName, const char* version, std::s
     if (n == 0) {
         return 0;
     }
-    // 3.
     const std::string text = value;
     if (text == "system") {
         return -3;
@@ -87,10 +81,9 @@ int PMSThirdPartyCheckLimit(const char* packageName, const char* version, std::s
     if (text == "non") {
         return -4;
     }
-    // 4.
     Json::Value parsed;
     bool isArray = fromString(text, parsed) && parsed.isArray() && !parsed.empty();
-    // 5. One range.
+    // One range.
     if (isArray && parsed[0].isString()) {
         const std::string a = parsed[0].asString();
         const std::string b = parsed.size() > 1 ? parsed[1].asString() : "";
@@ -100,7 +93,7 @@ int PMSThirdPartyCheckLimit(const char* packageName, const char* version, std::s
         limit = b;
         return -2;
     }
-    // 6. A list of bounds and ranges; `limit` ends as the highest bound met.
+    // A list of bounds and ranges; `limit` ends as the highest bound met.
     if (isArray && parsed[0].isArray()) {
         int result = -1;
         bool barred = false;
@@ -135,7 +128,7 @@ int PMSThirdPartyCheckLimit(const char* packageName, const char* version, std::s
         }
         return -2;
     }
-    // 7. A plain version.
+    // A plain version.
     limit = text;
     return PMSVersionNotLess(version, text.c_str()) ? 0 : -2;
 }

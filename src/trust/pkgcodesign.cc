@@ -23,22 +23,18 @@ constexpr size_t kPathSize = 4096;
 }  // namespace
 
 PKG_ERRCODE PackageManager::verifyPackageSignature(const char* path) {
-    // 1.
     if (path == nullptr) {
         return PKG_ERR_SIGNATURE_SYSTEM;
     }
-    // 2.
     char value[32] = "";
     if (VLIBCFileGetKeyValue(VLIBC_INFO_PATH, kTrustKey, value, sizeof(value), 0) < 0) {
         CORV_LOG_ERR("Failed to get: %s", kTrustKey);
         return PKG_ERR_SIGNATURE_SYSTEM;
     }
     const long level = strtol(value, nullptr, 10);
-    // 3.
     if (level == 2) {
         return PKG_SIGNATURE_OK;
     }
-    // 4.
     char absolute[kPathSize];
     if (path[0] == '/') {
         snprintf(absolute, sizeof(absolute), "%s", path);
@@ -54,7 +50,7 @@ PKG_ERRCODE PackageManager::verifyPackageSignature(const char* path) {
             return PKG_ERR_SIGNATURE_SYSTEM;
         }
     }
-    // 5. The tool's words are kept from the caller's output, which may be a protocol of
+    // The tool's words are kept from the caller's output, which may be a protocol of
     // its own (JSON for scripts); only the exit status is the answer.
     const char* const* command = CORVCodesignCommand();
     CORVUtils::ProcessRunner tool(command[0]);

@@ -180,7 +180,7 @@ int installCommand(const std::vector<std::string>& args, const char* command) {
     TmpLeftovers leftovers;
     LogCapture log;
 
-    // 1. The installability checks, so that a refusal comes with the desktop's report.
+    // The installability checks, so that a refusal comes with the desktop's report.
     PackageInfo info;
     PKG_ERRCODE code = PKG_OK;
     Json::Value data;
@@ -199,7 +199,7 @@ int installCommand(const std::vector<std::string>& args, const char* command) {
         return printFailure(opts.json, code, "not installable: " + text, details);
     }
 
-    // 2. The wizard's questions.
+    // The wizard's questions.
     PackageManager pm;
     PackageInfo withWizard;
     pm.queryPackageFileInfoWithWizard(file, withWizard, static_cast<PKG_INSTALLATION_TYPE>(0),
@@ -222,7 +222,7 @@ int installCommand(const std::vector<std::string>& args, const char* command) {
         }
     }
 
-    // 3. The message file may hold the words of an earlier operation: only a file that
+    // The message file may hold the words of an earlier operation: only a file that
     // this one wrote is the package's message now.
     const std::string messageFile = pm.getFixedLogFilePath(info.package);
     const FileStamp before = stampOf(messageFile);

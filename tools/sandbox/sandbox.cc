@@ -30,8 +30,8 @@
 // What of the host is visible. Overlayfs only shows the root filesystem itself, not the
 // filesystems mounted on it. Paths the command needs that live elsewhere are passed through
 // by bind mounts, read-write, at the same place:
-//   1. every --bind PATH, exactly as given (file or directory);
-//   2. for the working directory and for every absolute path among the command, its
+// every --bind PATH, exactly as given (file or directory);
+// for the working directory and for every absolute path among the command, its
 //      arguments (also the value of NAME=/path arguments) and --init: if the path lies on
 //      a filesystem other than the root one, the mount point of that filesystem (with
 //      everything mounted below it) - e.g. /work when /work is a mount of its own; if it

@@ -12,7 +12,7 @@
 namespace CORVUtils {
 
 class ProcessRunner {
-public:
+  public:
     // `program` is an absolute path; `args` are the arguments after argv[0].
     explicit ProcessRunner(std::string program, std::vector<std::string> args = {});
     ProcessRunner(std::string program, std::initializer_list<std::string> args);
@@ -37,6 +37,8 @@ public:
     void setTimeout(int seconds);
     // The child's working directory (default: the caller's).
     void setWorkingDirectory(const std::string& dir);
+    // The child's argv[0] (default: the program's path), e.g. the name of the script's role.
+    void setArgZero(const std::string& name);
 
     // Starts the child and, with `wait`, waits and returns its exit status (128 + signal
     // for a killed child). With `capture`, standard output and standard error are kept
@@ -58,11 +60,12 @@ public:
 
     static constexpr size_t kCaptureLimit = 4u << 20;
 
-private:
+  private:
     std::string program_;
     std::vector<std::string> args_;
     std::vector<std::pair<std::string, std::string>> env_;
     std::string workdir_;
+    std::string argZero_;
     bool hasIdentity_ = false;
     uid_t uid_ = 0;
     gid_t gid_ = 0;

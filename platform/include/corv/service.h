@@ -57,6 +57,10 @@ int VLIBServiceReload(const char* name);
 int VLIBServiceStatusGet(const char* name, int* state);
 // 1 running, 0 not (also for a service whose daemon is not installed).
 int VLIBServiceIsRunning(const char* name);
+// 1 when the job `name` is paused: held at rest by a shutdown or an upgrade that meant to
+// bring it back. The pause is kept apart from the job's definition and outlives it. 0 when
+// not paused, -1 when its state cannot be read.
+int VLIBServiceIsPaused(const char* name);
 // 1 when the service is enabled (its run key is 1, or it has none and is running).
 int VLIBServiceIsEnabled(const char* name);
 // The names of all services: the *.cfg files, sorted. Count, or negative.

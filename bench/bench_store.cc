@@ -62,7 +62,8 @@ int main(int argc, char** argv) {
         peak = std::max(peak, rss);
     }
     std::sort(times.begin(), times.end());
-    printf("%-40s median %8.1f ms  min %8.1f ms  max %8.1f ms  peak memory %6.1f MiB  (%d rounds)\n",
-           argv[2], times[times.size() / 2], times.front(), times.back(), peak / 1024.0, rounds);
+    printf(
+        "%-40s median %8.1f ms  min %8.1f ms  max %8.1f ms  peak memory %6.1f MiB  (%d rounds)\n",
+        argv[2], times[times.size() / 2], times.front(), times.back(), peak / 1024.0, rounds);
     return 0;
 }

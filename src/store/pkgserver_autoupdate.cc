@@ -13,6 +13,7 @@ namespace CORVPackageTool {
 namespace {
 
 constexpr int kLockSeconds = 15;
+#define PKG_PACKAGES_ETC_DIR "/usr/corv/etc/packages"
 
 // The timed file lock of the list, given back on every way out.
 class ListLock {
@@ -57,6 +58,10 @@ bool CORVPackageServer::Save(bool enabled, bool all, const Json::Value& names) {
     }
     if (!enabled || all || names.isNull() || !names.isArray()) {
         return true;
+    }
+    if (CORVFSMkdirP(PKG_PACKAGES_ETC_DIR, nullptr, 1, -1, -1, 0755) < 0) {
+        CORV_LOG_ERR("Fail to load %s, %m", PKG_AUTO_UPDATE_FILE);
+        return false;
     }
     ListLock lock(true);
     int fd =

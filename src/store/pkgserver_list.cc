@@ -6,7 +6,11 @@
 #include <time.h>
 
 #include <algorithm>
+#include <functional>
 #include <memory>
+#include <queue>
+#include <unordered_map>
+#include <unordered_set>
 
 #include "corv/log.h"
 #include "corvpkg/json_util.h"
@@ -85,6 +89,54 @@ std::string PMSListCachePath(const char* prefix, const char* language) {
     return dir + prefix + language;
 }
 
+namespace {
+
+// The order of the dependency graph's topological sort (dependents first; among the
+// packages whose dependencies are all placed, the one listed first goes to the latest free
+// place; of two records of one name the later takes the name's edges), computed with a
+// heap instead of the graph's dense matrix, whose cost grows with the cube of the count:
+// a store lists thousands of packages. False on a cycle.
+bool dependentsFirst(const std::vector<PackageInfo>& infos, std::vector<std::string>& order) {
+    const size_t count = infos.size();
+    std::unordered_map<std::string, size_t> vertex;
+    for (size_t i = 0; i < count; ++i) {
+        vertex[infos[i].package] = i;
+    }
+    std::vector<std::vector<size_t>> dependents(count);
+    std::vector<size_t> open(count, 0);  // dependencies not placed yet
+    for (size_t i = 0; i < count; ++i) {
+        std::unordered_set<size_t> seen;
+        for (const PackageBasicInfo& dep : infos[i].dep_packages) {
+            auto it = vertex.find(dep.package);
+            if (it != vertex.end() && seen.insert(it->second).second) {
+                dependents[it->second].push_back(i);
+                ++open[i];
+            }
+        }
+    }
+    std::priority_queue<size_t, std::vector<size_t>, std::greater<size_t>> ready;
+    for (size_t i = 0; i < count; ++i) {
+        if (open[i] == 0) {
+            ready.push(i);
+        }
+    }
+    order.assign(count, std::string());
+    size_t free = count;
+    while (!ready.empty()) {
+        const size_t v = ready.top();
+        ready.pop();
+        order[--free] = infos[v].package;
+        for (size_t dependent : dependents[v]) {
+            if (--open[dependent] == 0) {
+                ready.push(dependent);
+            }
+        }
+    }
+    return free == 0;
+}
+
+}  // namespace
+
 bool PMSSortPackageArray(const Json::Value& array, Json::Value& sorted) {
     if (!array.isArray()) {
         return false;
@@ -96,9 +148,9 @@ bool PMSSortPackageArray(const Json::Value& array, Json::Value& sorted) {
             return false;
         }
     }
-    PackageManager manager;
     std::vector<std::string> order;
-    if (!manager.topologicalSortPkgs(&infos, order)) {
+    if (!dependentsFirst(infos, order)) {
+        CORV_LOG_ERR("Cycle among the %zu packages of the list", infos.size());
         return false;
     }
     // The order lists dependents first; reversed, each package comes after what it needs.

@@ -154,19 +154,6 @@ TEST(Catalogue, PhasesSelectTableRowsInTableOrder) {
     }
 }
 
-TEST(Catalogue, TheLibrarysTableIsInItsFixedOrder) {
-    // Rows come with their worker classes, in the table's fixed order, ended by a null row.
-    const char* expected[] = {"service-cfg", "crontab-job", "corvcrond"};
-    size_t i = 0;
-    for (; g_BuiltinWorkers[i].id != nullptr; ++i) {
-        ASSERT_LT(i, sizeof(expected) / sizeof(expected[0]));
-        EXPECT_STREQ(g_BuiltinWorkers[i].id, expected[i]);
-    }
-    EXPECT_EQ(i, sizeof(expected) / sizeof(expected[0]));
-    EXPECT_EQ(DefaultCatalogue().table, g_BuiltinWorkers);
-    EXPECT_EQ(DefaultCatalogue().providerDir, "/usr/local/share/corvpkg");
-}
-
 TEST(Catalogue, AMalformedProviderListFailsButKeepsTheBuiltins) {
     TempDir tmp;
     const std::string dir = tmp.path();

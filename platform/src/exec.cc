@@ -180,6 +180,9 @@ FILE* VLIBCPopenv(const char* path, const char* mode, const char* const* argv) {
     {
         Spawn spawn;
         spawn.dupTo(theirs, reading ? STDOUT_FILENO : STDIN_FILENO);
+        if (strchr(mode, 'q') != nullptr) {
+            spawn.nullOn(STDERR_FILENO);
+        }
         const char* const alone[] = {path, nullptr};
         pid = spawn.start(path, argv ? argv : alone);
     }

@@ -2,9 +2,11 @@
 // started detached and ended by signal, and the job's log.
 #include <errno.h>
 #include <fcntl.h>
+#include <poll.h>
 #include <signal.h>
 #include <stdlib.h>
 #include <string.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <time.h>
 #include <unistd.h>
@@ -32,7 +34,6 @@ using Clock = std::chrono::steady_clock;
 // job does.
 constexpr char kJobPath[] = "PATH=/usr/local/sbin:/usr/local/bin:/usr/sbin:/usr/bin:/sbin:/bin";
 constexpr char kShell[] = "/bin/sh";
-constexpr char kEnvProgram[] = "/usr/bin/env";
 constexpr long kPollNanoseconds = 20 * 1000 * 1000;
 
 using corvplat::UniqueFd;
@@ -133,14 +134,38 @@ void nap() {
     nanosleep(&ts, nullptr);
 }
 
-// Waits up to `seconds` for the process to end. True when it did.
+// A descriptor that polls readable when `pid` ends, or -1 where the kernel has none. The
+// process need not be our child: a job's main process is the grandchild of its starter.
+int processHandle(int pid) {
+#ifdef SYS_pidfd_open
+    return static_cast<int>(syscall(SYS_pidfd_open, pid, 0));
+#else
+    (void)pid;
+    return -1;
+#endif
+}
+
+// Waits up to `seconds` for the process to end. True when it did. The end is waited for
+// through a process handle; asking at intervals is left for kernels without one.
 bool waitForEnd(int pid, unsigned long long startTime, int seconds) {
     const Clock::time_point deadline = Clock::now() + std::chrono::seconds(seconds);
+    UniqueFd handle(processHandle(pid));
     while (ProcessStartTime(pid) == startTime) {
-        if (Clock::now() >= deadline) {
+        const Clock::time_point now = Clock::now();
+        if (now >= deadline) {
             return false;
         }
-        nap();
+        if (handle.get() < 0) {
+            nap();
+            continue;
+        }
+        // The handle was opened before the start time was compared, so it is this
+        // process's and not a later one's that took over the number.
+        const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(deadline - now);
+        struct pollfd ended = {handle.get(), POLLIN, 0};
+        if (poll(&ended, 1, static_cast<int>(left.count()) + 1) < 0 && errno != EINTR) {
+            handle.reset();
+        }
     }
     return true;
 }
@@ -175,15 +200,15 @@ int OpenJobLog(const Job& job) {
 
 int RunJobProcess(const Job& job, const Process& process, const char* what,
                   const Variables& extra) {
-    // env -i: the runner adds to the caller's environment, and a job must not see it.
-    std::vector<std::string> args{"-i"};
-    for (std::string& entry : JobEnvironment(job, extra)) {
-        args.push_back(std::move(entry));
+    std::vector<std::string> words = shellWords(job, process, what);
+    CORVUtils::ProcessRunner runner(words[0],
+                                    std::vector<std::string>(words.begin() + 1, words.end()));
+    // A job must not see the environment of whoever asked for it.
+    runner.clearEnvironment();
+    for (const std::string& entry : JobEnvironment(job, extra)) {
+        const size_t eq = entry.find('=');
+        runner.addEnv(entry.substr(0, eq), entry.substr(eq + 1));
     }
-    for (std::string& word : shellWords(job, process, what)) {
-        args.push_back(std::move(word));
-    }
-    CORVUtils::ProcessRunner runner(kEnvProgram, std::move(args));
     runner.setWorkingDirectory("/");
     runner.setTimeout(kScriptTimeout);
     UniqueFd log(OpenJobLog(job));

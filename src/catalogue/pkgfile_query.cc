@@ -1,8 +1,10 @@
 // Reading a package file: single members through /bin/tar, never the whole archive.
+#include <openssl/evp.h>
 #include <stdio.h>
 #include <string.h>
 
 #include <string>
+#include <vector>
 
 #include "corv/log.h"
 #include "corv/process_runner.h"
@@ -32,9 +34,14 @@ class TempFolder {
     std::string path_;
 };
 
-int extract(const std::string& cpkFile, const std::string& dir, const std::string& member,
-            bool keepPermissions, CORVUtils::ProcessRunner* keep = nullptr) {
-    CORVUtils::ProcessRunner tar("/bin/tar", {"xf", cpkFile, "-C", dir, member, "--no-same-owner"});
+int extract(const std::string& cpkFile, const std::string& dir,
+            const std::vector<std::string>& members, bool keepPermissions,
+            CORVUtils::ProcessRunner* keep = nullptr) {
+    CORVUtils::ProcessRunner tar("/bin/tar", {"xf", cpkFile, "-C", dir});
+    for (const std::string& member : members) {
+        tar.addArguments(member);
+    }
+    tar.addArguments("--no-same-owner");
     if (!keepPermissions) {
         tar.addArguments("--no-same-permissions");
     }
@@ -50,7 +57,7 @@ int extract(const std::string& cpkFile, const std::string& dir, const std::strin
 bool PMSExtractPackageInfo(const std::string& dir, const std::string& cpkFile, PackageInfo& info,
                            const char* language) {
     CORVUtils::ProcessRunner infoRun("/bin/tar");
-    if (extract(cpkFile, dir, "INFO", true, &infoRun) != 0) {
+    if (extract(cpkFile, dir, {"INFO"}, true, &infoRun) != 0) {
         CORV_LOG_ERR("Failed to extract package INFO to %s", dir.c_str());
         CORV_LOG_ERR("%s", infoRun.toString().c_str());
         if (!infoRun.getCapturedOutput().empty()) {
@@ -61,8 +68,16 @@ bool PMSExtractPackageInfo(const std::string& dir, const std::string& cpkFile, P
         }
         return false;
     }
-    // conf/ is optional.
-    extract(cpkFile, dir, "conf", true);
+    // conf/ and the scripts are optional, so one tar run takes them all and its verdict
+    // does not matter: a member that is missing is simply not there. Every fork costs a
+    // pass over the archive's headers, and a query runs on each inspect and install.
+    // The scripts are taken even when INFO does not read; they are not looked at then.
+    std::vector<std::string> optional{"conf"};
+    for (const PKG_SCRIPT_ENTRY& script : g_PackageScripts) {
+        optional.push_back(std::string("scripts/") + script.name);
+    }
+    extract(cpkFile, dir, optional, false);
+    // A member that is a link would be read, or a script's target made executable, through it.
     if (!PMSCheckPackageMembers(dir)) {
         return false;
     }
@@ -71,15 +86,6 @@ bool PMSExtractPackageInfo(const std::string& dir, const std::string& cpkFile, P
     info.script_mask = 0;
     if (!loaded) {
         return true;
-    }
-    for (const PKG_SCRIPT_ENTRY& script : g_PackageScripts) {
-        char member[128];
-        snprintf(member, sizeof(member), "scripts/%s", script.name);
-        extract(cpkFile, dir, member, false);
-    }
-    // A script that is a link would have its target made executable here.
-    if (!PMSCheckPackageMembers(dir)) {
-        return false;
     }
     info.script_mask = PMGetScriptMask(dir + "/scripts");
     return true;
@@ -104,37 +110,57 @@ bool PackageManager::queryPackageFileInfo(const std::string& cpkFile, PackageInf
     return true;
 }
 
+namespace {
+
+// The MD5 of the member `package.tgz` as /usr/bin/openssl prints it (lower-case hex),
+// read from tar's standard output: the payload is read once, hashed while tar reads on,
+// and never written to disk. Empty when tar cannot give the member.
+std::string payloadChecksum(const std::string& cpkFile) {
+    FILE* out = VLIBCPopen("/bin/tar", "rq", "xOf", cpkFile.c_str(), "package.tgz", nullptr);
+    if (out == nullptr) {
+        return "";
+    }
+    EVP_MD_CTX* md5 = EVP_MD_CTX_new();
+    bool ok = md5 != nullptr && EVP_DigestInit_ex(md5, EVP_md5(), nullptr) == 1;
+    std::vector<unsigned char> chunk(256 * 1024);
+    size_t n;
+    while ((n = fread(chunk.data(), 1, chunk.size(), out)) > 0) {
+        ok = ok && EVP_DigestUpdate(md5, chunk.data(), n) == 1;
+    }
+    ok = !ferror(out) && VLIBCPclose(out) == 0 && ok;
+    unsigned char digest[EVP_MAX_MD_SIZE];
+    unsigned int size = 0;
+    ok = ok && EVP_DigestFinal_ex(md5, digest, &size) == 1;
+    EVP_MD_CTX_free(md5);
+    if (!ok) {
+        return "";
+    }
+    std::string hex;
+    for (unsigned int i = 0; i < size; ++i) {
+        char pair[3];
+        snprintf(pair, sizeof(pair), "%02x", digest[i]);
+        hex += pair;
+    }
+    return hex;
+}
+
+}  // namespace
+
 bool PackageManager::verifyPackageTgzFile(const std::string& cpkFile, const char* checksum) {
     if (cpkFile.empty()) {
         CORV_LOG_ERR("Wrong parameters");
         return false;
     }
-    std::string tmp;
-    if (!PMSCreateTmpFolder(tmp)) {
-        CORV_LOG_ERR("Failed to generate temp filename");
-        return false;
-    }
-    // The work directory repeats the temporary path under itself. Only that inner
-    // directory, which holds the extracted payload, is removed at the end; the empty
-    // outer folder stays.
-    const std::string work = tmp + "/" + tmp;
-    TempFolder inner(work);
-    CORVUtils::ProcessRunner mkdirRun("/bin/mkdir", {"-p", work});
-    if (mkdirRun.run(true, true) != 0) {
-        CORV_LOG_ERR("Failed to mkdir tempdir %s", work.c_str());
-        return false;
-    }
     if (checksum == nullptr) {
         return true;
     }
-    if (extract(cpkFile, work, "package.tgz", true) != 0) {
-        CORV_LOG_ERR("Failed to extract the package.tgz in %s", work.c_str());
-        PMSExplainFailedUnpack(*this, work, PMSArchiveBytes(cpkFile, false, "package.tgz"));
+    const std::string sum = payloadChecksum(cpkFile);
+    if (sum.empty()) {
+        CORV_LOG_ERR("Failed to extract the package.tgz in %s", cpkFile.c_str());
         return false;
     }
-    char path[4096];
-    snprintf(path, sizeof(path), "%s/package.tgz", work.c_str());
-    if (!PMSCompareCheckSum(path, checksum)) {
+    // Byte for byte: the INFO key must be in the tool's lower case.
+    if (sum != checksum) {
         CORV_LOG_ERR("Failed to verify %s", cpkFile.c_str());
         return false;
     }

@@ -66,8 +66,13 @@ bool isScript(const std::string& name) {
            name.compare(name.size() - kSuffix.size(), kSuffix.size(), kSuffix) == 0;
 }
 
-int extractMember(const std::string& cpkFile, const std::string& dir, const std::string& member) {
-    CORVUtils::ProcessRunner tar("/bin/tar", {"xf", cpkFile, "-C", dir, member, "--no-same-owner"});
+int extractMembers(const std::string& cpkFile, const std::string& dir,
+                   const std::vector<std::string>& members) {
+    CORVUtils::ProcessRunner tar("/bin/tar", {"xf", cpkFile, "-C", dir});
+    for (const std::string& member : members) {
+        tar.addArguments(member);
+    }
+    tar.addArguments("--no-same-owner");
     return tar.run(true, true);
 }
 
@@ -90,7 +95,7 @@ bool PMSExtractUIFile(const char* cpkFile, const char* dir, const std::string& m
     }
     const std::string extracted = std::string(dir) + "/" + member;
     // A wizard script that is a link would run its target; a pipe would stall the read.
-    if (extractMember(cpkFile, dir, member) != 0 || !PMSCheckPackageMembers(dir) ||
+    if (extractMembers(cpkFile, dir, {member}) != 0 || !PMSCheckPackageMembers(dir) ||
         !VLIBCFileExist(extracted.c_str())) {
         return false;
     }
@@ -216,8 +221,10 @@ bool PackageManager::parseUIFile(const std::string& cpkFile, const std::string& 
                                  PKG_INSTALLATION_TYPE type, PackageInfo& info,
                                  const char* language) {
     for (const std::string& candidate : PMSUIFileCandidates(language, type)) {
-        std::string path;
-        if (!PMSExtractUIFile(cpkFile.c_str(), dir.c_str(), candidate, path)) {
+        // A file that the caller took out already is not extracted a second time.
+        std::string path = dir + "/" + candidate;
+        if (!VLIBCFileExist(path.c_str()) &&
+            !PMSExtractUIFile(cpkFile.c_str(), dir.c_str(), candidate, path)) {
             continue;
         }
         readCandidate(info, cpkFile.c_str(), path, language, type, info.wizard);
@@ -232,7 +239,6 @@ bool PackageManager::parseUIFile(const std::string& cpkFile, const std::string& 
 bool PackageManager::queryPackageFileInfoWithWizard(const std::string& cpkFile, PackageInfo& info,
                                                     PKG_INSTALLATION_TYPE type,
                                                     const char* language) {
-    // The folder goes on every way out (6).
     if (cpkFile.empty()) {
         CORV_LOG_ERR("Wrong parameters");
         return false;
@@ -242,23 +248,27 @@ bool PackageManager::queryPackageFileInfoWithWizard(const std::string& cpkFile, 
         CORV_LOG_ERR("Failed to generate temp filename");
         return false;
     }
-    TempFolder cleanup(tmp);
+    TempFolder cleanup(tmp);  // the folder goes on every way out
     if (!PMSExtractPackageInfo(tmp, cpkFile, info, language)) {
         CORV_LOG_ERR("Failed to query info");
         return false;
     }
+    if (type == 0) {
+        type = PMSCheckPackage(info.package) ? PKG_UPGRADE : PKG_INSTALL;
+    }
+    // The licence and every wizard file this operation may use come out in one tar run;
+    // each is optional, so what is missing is simply not there afterwards.
+    std::vector<std::string> members{"LICENSE"};
+    for (const std::string& candidate : PMSUIFileCandidates(language, type)) {
+        members.push_back(candidate);
+    }
+    extractMembers(cpkFile, tmp, members);
     // A package need not have a licence; a longer one is cut, not refused.
     const std::string license = tmp + "/LICENSE";
-    if (extractMember(cpkFile, tmp, "LICENSE") == 0 && !PMSCheckPackageMembers(tmp)) {
-        return false;
-    }
     if (VLIBCFileExist(license.c_str()) &&
         !PMReadFile(license.c_str(), kLicenseLimit, info.license, nullptr)) {
         CORV_LOG_ERR("Failed to read license file LICENSE in %s", cpkFile.c_str());
         return false;
-    }
-    if (type == 0) {
-        type = PMSCheckPackage(info.package) ? PKG_UPGRADE : PKG_INSTALL;
     }
     return parseUIFile(cpkFile, tmp, type, info, language);
 }

@@ -122,7 +122,7 @@ TEST(PackageFile, DamagedFiles) {
     PackageInfo cut;
     pm.queryPackageFileInfo("/tmp/truncated.cpk", cut, PKG_INSTALL, "enu");
     EXPECT_FALSE(pm.verifyPackageTgzFile("/tmp/truncated.cpk", "0123"));
-    EXPECT_EQ(entries("/volume1/@tmp"), 1) << "only the empty outer folder of the payload check";
+    EXPECT_EQ(entries("/volume1/@tmp"), 0) << "the payload is checked without a folder";
 }
 
 TEST(PackageFile, ScriptsWithoutTheExecuteBitAreMadeRunnable) {

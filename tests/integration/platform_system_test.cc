@@ -10,6 +10,7 @@
 #include <string>
 #include <vector>
 
+#include "corv/process_runner.h"
 #include "corv/service.h"
 #include "corv/vlibc.h"
 #include "support/files.h"
@@ -113,4 +114,29 @@ TEST(PlatformSystem, FullVolumeIsNoSpace) {
     unlink("/volume1/filler");
     EXPECT_EQ(VLIBCFileSetKeyValue(conf.c_str(), "key", "new", nullptr), 0);
     EXPECT_EQ(testutil::readFile(conf), "key=\"new\"\n");
+}
+
+// tar finds the platform's pigz as its gzip; every other program keeps the caller's PATH.
+TEST(PlatformSystem, TarAloneGetsTheFasterGzip) {
+    if (access("/usr/bin/pigz", X_OK) != 0) {
+        GTEST_SKIP() << "no pigz on this machine";
+    }
+    char target[256] = "";
+    ASSERT_GT(readlink("/usr/corv/libexec/tar-gzip/gzip", target, sizeof(target) - 1), 0);
+    EXPECT_STREQ(target, "/usr/bin/pigz");
+
+    testutil::writeFile("/tmp/member", "x");
+    ASSERT_EQ(VLIBCExecl("/bin/tar", 0xbb, "czf", "/tmp/a.tgz", "-C", "/tmp", "member", nullptr),
+              0);
+    // --to-command runs with tar's own environment: it shows the PATH tar searched.
+    CORVUtils::ProcessRunner tar("/bin/tar",
+                                 {"xzf", "/tmp/a.tgz", "--to-command=/bin/sh -c 'echo \"$PATH\"'"});
+    ASSERT_EQ(tar.run(true, true), 0) << tar.getCapturedOutputErr();
+    EXPECT_EQ(tar.getCapturedOutput().rfind("/usr/corv/libexec/tar-gzip:", 0), 0u)
+        << tar.getCapturedOutput();
+
+    CORVUtils::ProcessRunner shell("/bin/sh", {"-c", "echo \"$PATH\""});
+    ASSERT_EQ(shell.run(true, true), 0);
+    EXPECT_EQ(shell.getCapturedOutput().find("tar-gzip"), std::string::npos)
+        << shell.getCapturedOutput();
 }

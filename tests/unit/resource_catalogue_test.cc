@@ -155,11 +155,6 @@ TEST(Catalogue, PhasesSelectTableRowsInTableOrder) {
     }
 }
 
-TEST(Catalogue, TheDefaultCatalogueIsTheLibrarysTableAndProviderDirectory) {
-    EXPECT_EQ(DefaultCatalogue().table, g_BuiltinWorkers);
-    EXPECT_EQ(DefaultCatalogue().providerDir, "/usr/local/share/corvpkg");
-}
-
 TEST(Catalogue, AMalformedProviderListFailsButKeepsTheBuiltins) {
     TempDir tmp;
     const std::string dir = tmp.path();

@@ -44,23 +44,6 @@ IWorker* makeNothing() {
 
 }  // namespace
 
-TEST(ActionInfo, StartsEmptyAndKeepsWhatIsSet) {
-    ActionInfo action;
-    EXPECT_EQ(action.GetPkgName(), "");
-    EXPECT_EQ(action.GetPkgUserName(), "");
-    EXPECT_EQ(action.GetActionType(), 0u);
-    EXPECT_EQ(action.GetRootDir(), "");
-    action.SetPkgName("demo");
-    action.SetPkgUserName("demouser");
-    action.SetActionType(2);
-    action.SetRootDir("/var/packages/demo/target");
-    ActionInfo copy = action;
-    EXPECT_EQ(copy.GetPkgName(), "demo");
-    EXPECT_EQ(copy.GetPkgUserName(), "demouser");
-    EXPECT_EQ(copy.GetActionType(), 2u);
-    EXPECT_EQ(copy.GetRootDir(), "/var/packages/demo/target");
-}
-
 TEST(WorkerResp, MessagesKeepOrderSectionKeyAndArguments) {
     WorkerResp resp;
     EXPECT_EQ(toString(resp.GetErrJsonArray()), "[]");
@@ -131,26 +114,6 @@ TEST(BuiltinBackend, NullFactoryIsNotReadyAndNullWorkerIsEmpty) {
     EXPECT_FALSE(nothing.CreateWorker());
 }
 
-TEST(WorkerProxy, DefaultsAndAccessors) {
-    WorkerProxy proxy(new BuiltinBackend(&makeMinimal));
-    EXPECT_EQ(proxy.GetResourceID(), "");
-    EXPECT_EQ(proxy.GetInterval(), 0u);
-    EXPECT_EQ(proxy.GetProvider(), "NOS");
-    proxy.SetResourceID("port-config");
-    proxy.SetInterval(0x22);
-    proxy.SetProvider("OtherPkg");
-    EXPECT_EQ(proxy.GetResourceID(), "port-config");
-    EXPECT_EQ(proxy.GetInterval(), 0x22u);
-    EXPECT_EQ(proxy.GetProvider(), "OtherPkg");
-    std::shared_ptr<IWorker> worker = proxy.CreateInstance();
-    EXPECT_TRUE(worker);
-    worker.reset();
-    EXPECT_EQ(g_alive, 0);
-
-    WorkerProxy empty(nullptr);
-    EXPECT_FALSE(empty.CreateInstance());
-}
-
 TEST(DSOBackend, UnusableObjectsAreNotReadyWithTheirCause) {
     TempDir tmp;
     testutil::writeFile(tmp.path() + "/text.so", "not an ELF object\n");
@@ -175,23 +138,3 @@ TEST(DSOBackend, UnusableObjectsAreNotReadyWithTheirCause) {
     }
 }
 
-TEST(Timing, WordsOfThePhases) {
-    struct {
-        unsigned int timing;
-        const char* word;
-    } const kWords[] = {
-        {TIMING_PREINST, "preinst"},
-        {TIMING_POSTINST, "postinst"},
-        {TIMING_ENABLE, "enable"},
-        {TIMING_STARTUP, "startup"},
-        {TIMING_PREUNINST, "preuninst"},
-        {TIMING_POSTUNINST, "postuninst"},
-        {TIMING_DISABLE, "disable"},
-        {TIMING_HALT, "halt"},
-        {0x03, ""},
-        {0, ""},
-    };
-    for (const auto& w : kWords) {
-        EXPECT_STREQ(TimingWord(w.timing), w.word) << std::hex << w.timing;
-    }
-}

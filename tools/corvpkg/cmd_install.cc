@@ -4,9 +4,10 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <atomic>
 #include <chrono>
+#include <condition_variable>
 #include <fstream>
+#include <mutex>
 #include <sstream>
 #include <string>
 #include <thread>
@@ -36,7 +37,12 @@ class ProgressWatcher {
         thread_ = std::thread([this] { loop(); });
     }
     ~ProgressWatcher() {
-        stop_ = true;
+        {
+            std::lock_guard<std::mutex> hold(mutex_);
+            stop_ = true;
+        }
+        // Woken at once: the operation is over and must not wait out a polling pause.
+        wake_.notify_one();
         thread_.join();
         poll();
     }
@@ -50,9 +56,12 @@ class ProgressWatcher {
                message.compare(message.size() - kOk.size(), kOk.size(), kOk) == 0;
     }
     void loop() {
+        std::unique_lock<std::mutex> hold(mutex_);
         while (!stop_) {
+            hold.unlock();
             poll();
-            std::this_thread::sleep_for(std::chrono::milliseconds(100));
+            hold.lock();
+            wake_.wait_for(hold, std::chrono::milliseconds(100), [this] { return stop_; });
         }
     }
     void poll() {
@@ -82,7 +91,9 @@ class ProgressWatcher {
     std::string progress_;
     long long offset_ = 0;
     std::string lastProgress_;
-    std::atomic<bool> stop_{false};
+    std::mutex mutex_;
+    std::condition_variable wake_;
+    bool stop_ = false;
     std::thread thread_;
 };
 

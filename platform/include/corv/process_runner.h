@@ -26,6 +26,8 @@ class ProcessRunner {
     // Sets NAME=value in the child's environment, on top of the caller's own environment
     // (a later addEnv of the same name wins).
     void addEnv(const std::string& name, const std::string& value);
+    // The child gets only what addEnv sets, nothing of the caller's environment.
+    void clearEnvironment();
 
     // Runs the child as `user`: its uid, and the group of that user (`ownGroup`) or the
     // system group "system" (gid 1 on the appliance; the reference platform uses the
@@ -41,7 +43,9 @@ class ProcessRunner {
     void setArgZero(const std::string& name);
 
     // Starts the child and, with `wait`, waits and returns its exit status (128 + signal
-    // for a killed child). With `capture`, standard output and standard error are kept
+    // for a killed child). "/bin/rm -rf" of paths none of which exists, and "/bin/mkdir -p"
+    // of directories that all exist, would do nothing and exit 0: they are answered so
+    // without starting a process. With `capture`, standard output and standard error are kept
     // for getCapturedOutput()/getCapturedOutputErr() (each kept up to kCaptureLimit bytes;
     // the rest is read and dropped, so a chatty child never blocks). Without `wait` the
     // child is left running and 0 is returned. -1 when the program cannot be started.
@@ -64,6 +68,7 @@ class ProcessRunner {
     std::string program_;
     std::vector<std::string> args_;
     std::vector<std::pair<std::string, std::string>> env_;
+    bool clearEnv_ = false;
     std::string workdir_;
     std::string argZero_;
     bool hasIdentity_ = false;

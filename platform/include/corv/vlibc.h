@@ -219,8 +219,9 @@ int VLIBCExecl(const char* path, int flags, ...);
 // program with argv[0] = path alone. With `wait` the exit status as above; without, 0
 // once started (the child is reaped by nobody: callers that do not wait detach it).
 int VLIBCExecv(const char* path, const char* const* argv, int wait);
-// A pipe to a program's standard output ("r") or input ("w"). VLIBCPclose waits and gives
-// the exit status, as VLIBCExec does. Null when it cannot be started.
+// A pipe to a program's standard output ("r") or input ("w"); a "q" in the mode ("rq")
+// sends the program's standard error to /dev/null. VLIBCPclose waits and gives the exit
+// status, as VLIBCExec does. Null when it cannot be started.
 FILE* VLIBCPopen(const char* path, const char* mode, ...);
 FILE* VLIBCPopenv(const char* path, const char* mode, const char* const* argv);
 int VLIBCPclose(FILE* stream);

@@ -105,12 +105,13 @@ class SyslogConfig : public CORV::PkgUtils::IWorker {
   public:
     int Acquire(const CORV::PkgUtils::ActionInfo& action, const Json::Value& request,
                 Json::Value& /*own*/, CORV::PkgUtils::WorkerResp& /*resp*/) override {
-        if (!request.isObject() || !CheckField(request, kPatternDbKey, &Json::Value::isString) ||
+        if (!request.isObject()) {
+            VLIBCErrSet(ERR_MALFORMED);
+            return 1;
+        }
+        if (!CheckField(request, kPatternDbKey, &Json::Value::isString) ||
             !CheckField(request, kPatternIncKey, &Json::Value::isArray) ||
             !CheckField(request, kLogrotateKey, &Json::Value::isString)) {
-            if (!request.isObject()) {
-                VLIBCErrSet(ERR_MALFORMED);
-            }
             return 1;
         }
         const std::string& pkg = action.GetPkgName();

@@ -173,7 +173,8 @@ int writeEntry(const CORVSHARE& share, bool mustExist) {
 }  // namespace
 
 bool CORVShareNameIsValid(const char* name) {
-    if (name == nullptr || name[0] == '\0' || name[0] == '.' || name[0] == ' ' ||
+    // A leading "@" is the volume's own folders (@appstore, @tmp): never a share.
+    if (name == nullptr || name[0] == '\0' || name[0] == '.' || name[0] == ' ' || name[0] == '@' ||
         strlen(name) > kMaxNameLength) {
         return false;
     }

@@ -121,9 +121,9 @@ TEST(ServiceSystem, ServiceFilesAreChecked) {
 TEST(ServiceSystem, TheSystemServicesAreThere) {
     List list;
     EXPECT_EQ(VLIBServiceEnum(&list.p), 8);
-    EXPECT_EQ(list.items(), (std::vector<std::string>{"corvindexd", "corvmkflvd", "corvmkthumbd",
-                                                      "crond", "nginx", "pgsql", "ssh-shell",
-                                                      "syslog-ng"}));
+    EXPECT_EQ(list.items(),
+              (std::vector<std::string>{"corvindexd", "corvmkflvd", "corvmkthumbd", "crond",
+                                        "nginx", "pgsql", "ssh-shell", "syslog-ng"}));
     for (const std::string& name : list.items()) {
         EXPECT_EQ(VLIBServicecfgValidate((VLIB_SERVICE_CFG_DIR "/" + name + ".cfg").c_str()), 0)
             << name;

@@ -17,7 +17,7 @@
 // others are set from the lists as a whole (VLIBSharePrivListSet and CORVShareUpdate).
 //
 // Share names: 1 to 64 characters of letters, digits, blank and "_-.+@", not beginning
-// with "." or a blank; anything else is refused with ERR_BAD_PARAMETERS, so that a name
+// with ".", "@" or a blank; anything else is refused with ERR_BAD_PARAMETERS, so that a name
 // never leads out of its volume. Names compare exactly.
 #pragma once
 

@@ -119,8 +119,9 @@ TEST(CliPackage, DependencyOrdersFromTheCommandLine) {
         const char* b;
         int status;
     } compares[] = {
-        {"1.10", ">", "1.9", 0},   {"1.2", "=", "1.2.0", 0}, {"1.2", "<", "1.2-5", 0},
-        {"2.0", "<=", "1.9.9", 1}, {"1.0", "~", "1.0", 2},
+        {"1.10", ">", "1.9", 0},     {"1.2", "=", "1.2.0", 0}, {"1.2", "<", "1.2-5", 0},
+        {"2.0", "<=", "1.9.9", 1},   {"1.0", "~", "1.0", 2},   {"abc", "<", "1.0", 2},
+        {"1.0", "=", "1.0-beta", 2},
     };
     for (const auto& c : compares) {
         EXPECT_EQ(run(kCli, {"version-compare", c.a, c.op, c.b}).status, c.status)
@@ -136,6 +137,7 @@ TEST(CliPackage, ListAndStatusOfInstalledPackages) {
     Json::Value rows;
     ASSERT_TRUE(CORVPackageTool::fromString(list.out, rows)) << list.out;
     ASSERT_EQ(rows.size(), 2u);
+    EXPECT_EQ(rows[0]["package"].asString(), "down") << "sorted by name: " << list.out;
     for (const Json::Value& row : rows) {
         ASSERT_NE(row["package"].asString(), "half");
         EXPECT_EQ(row["volume"].asString(), "/volume1");

@@ -131,10 +131,10 @@ const std::vector<Command>& commands() {
          "Exit status: 0 no errors (warnings allowed), 1 errors, 2 usage error.\n",
          cmdLint},
         {"new", "write a package source directory to start from",
-         "usage: corvpkg new <name> [dir] [--json]\n"
+         "usage: corvpkg new <package-name> [dir] [--json]\n"
          "\n"
-         "Writes a package source for <name> into [dir] (default ./<name>; it must not exist\n"
-         "or be empty): INFO, a payload program package/bin/<name>-daemon, a\n"
+         "Writes a package source for <package-name> into [dir] (default: ./<package-name>;\n"
+         "it must not exist or be empty): INFO, a payload program package/bin/<name>-daemon, a\n"
          "start-stop-status that starts, stops and asks it, the other six scripts, an empty\n"
          "install wizard and an empty conf/resource, each commented on what goes in it. It\n"
          "lints clean and builds, installs and starts as it stands.\n"

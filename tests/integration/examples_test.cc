@@ -30,6 +30,7 @@
 #include "corvpkg/privilege.h"
 #include "corvpkg/resource.h"
 #include "support/files.h"
+#include "support/http.h"
 #include "support/pkg_kit.h"
 #include "support/run.h"
 
@@ -430,4 +431,39 @@ TEST(Examples, GreeterKeepsTheWizardAnswersThroughAnUpgrade) {
               std::string::npos)
         << "the old package's preuninst runs as the package user\n"
         << record;
+}
+
+TEST(Examples, NotesKeepsItsNotesInItsOwnDatabaseBehindTheWebServer) {
+    if (!testutil::exists("/usr/bin/psql") || !testutil::exists("/usr/sbin/nginx")) {
+        GTEST_SKIP() << "PostgreSQL or nginx is not installed (scripts/setup-deps.sh)";
+    }
+    ASSERT_EQ(VLIBServiceStart("pgsql", 0), 0);
+    ASSERT_EQ(VLIBServiceStart("nginx", 0), 0);
+    acceptUnsignedPackages();
+    ASSERT_NO_FATAL_FAILURE(buildAllWithTheScript());
+    ASSERT_EQ(engineInstall(cpkOf("notes", "1.0.0-0001"), true), 1);
+    auto served = [](const std::string& text) {
+        return
+            [text](const testutil::HttpReply& r) { return r.body.find(text) != std::string::npos; };
+    };
+    testutil::HttpReply page = testutil::httpGetUntil(5000, "/notes/", served("notes 1.0.0"));
+    EXPECT_EQ(page.body, "notes 1.0.0-0001\n");
+    EXPECT_EQ(page.headers["content-security-policy"],
+              "default-src 'self'; frame-ancestors 'none'; img-src 'self' data:");
+    EXPECT_EQ(testutil::httpGet(5000, "/notes/add?text=it%27s+here").body, "added: it's here\n");
+
+    ASSERT_EQ(engineInstall(cpkOf("notes", "1.1.0-0001"), true), 1) << "the upgrade";
+    EXPECT_EQ(testutil::httpGetUntil(5000, "/notes/", served("1.1.0")).body,
+              "notes 1.1.0-0001\nit's here\n");
+
+    PackageManager pm;
+    ASSERT_EQ(pm.uninstall("notes", nullptr, "enu", PKG_UNINSTALL, false, nullptr), 1);
+    auto r = run("/usr/bin/psql", {"-X", "-U", "postgres", "-tAc",
+                                   "SELECT count(*) FROM pg_database WHERE datname = 'notes'"});
+    EXPECT_EQ(r.out, "0\n") << "its database went with it";
+    EXPECT_EQ(
+        testutil::httpGetUntil(5000, "/notes/",
+                               [](const testutil::HttpReply& reply) { return reply.status == 0; })
+            .status,
+        0);
 }

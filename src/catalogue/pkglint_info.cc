@@ -276,7 +276,7 @@ void lintOSVersions(const Keys& keys, LintReport& report) {
         int b[3] = {0, 0, 0};
         parseOS(*low, a);
         parseOS(*high, b);
-        if ((b[0] || b[1] || b[2]) && std::vector<int>(a, a + 3) > std::vector<int>(b, b + 3)) {
+        if ((b[0] || b[1] || b[2]) && std::lexicographical_compare(b, b + 3, a, a + 3)) {
             report.error(kInfo,
                          "the lower OS limit " + *low + " is above the upper one " + *high +
                              "; no OS accepts the package",

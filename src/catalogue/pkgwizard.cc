@@ -263,6 +263,10 @@ bool PackageManager::queryPackageFileInfoWithWizard(const std::string& cpkFile, 
         members.push_back(candidate);
     }
     extractMembers(cpkFile, tmp, members);
+    // A licence or wizard file that is a link would be read through it; a pipe would stall.
+    if (!PMSCheckPackageMembers(tmp)) {
+        return false;
+    }
     // A package need not have a licence; a longer one is cut, not refused.
     const std::string license = tmp + "/LICENSE";
     if (VLIBCFileExist(license.c_str()) &&

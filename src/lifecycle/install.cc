@@ -30,6 +30,17 @@ PKG_ERRCODE spaceOr(PKG_ERRCODE otherwise) {
     return VLIBCErrGet() == ERR_NO_SPACE ? PKG_ERR_NO_SPACE : otherwise;
 }
 
+// A refusal for want of room says which volume is full, how much was needed and how much
+// was free, so that nobody takes it for a damaged file.
+void refuseForSpace(PackageManager& pm, PKG_ERRCODE otherwise, const std::string& volume,
+                    unsigned long long size) {
+    pm.setResult(spaceOr(otherwise));
+    if (pm.getResult() == PKG_ERR_NO_SPACE) {
+        const std::string where = volume.empty() ? "/volume1" : volume;
+        PMSReportNoSpace(pm, where, size + PKG_VOLUME_MARGIN, PMSFreeBytes(where));
+    }
+}
+
 // What the dispatcher's steps share: the package file, what it holds, what is installed
 // under its name, and where the operation is to run.
 struct Dispatch {
@@ -173,7 +184,7 @@ bool measureSpace(Dispatch& r) {
     r.size = r.info.extractsize != 0 ? static_cast<unsigned long long>(r.info.extractsize)
                                      : r.fileSize * 3 / 2;
     if (r.wanted.empty() && !PMSGetTmpDir(r.size, r.wanted)) {
-        r.pm.setResult(spaceOr(PKG_ERR_SYSTEM));
+        refuseForSpace(r.pm, PKG_ERR_SYSTEM, r.volume, r.size);
         CORV_LOG_ERR("No available tmp path");
         return false;
     }
@@ -187,7 +198,7 @@ bool findStoreVolume(Dispatch& r) {
     }
     if (r.action == kActionRepair && !VLIBCIsDockette() && r.info.install_type != "system") {
         if (!PMSGetTmpDir(r.size, r.wanted)) {
-            r.pm.setResult(spaceOr(PKG_ERR_SYSTEM));
+            refuseForSpace(r.pm, PKG_ERR_SYSTEM, r.volume, r.size);
             CORV_LOG_ERR("No available tmp path");
             return false;
         }
@@ -196,10 +207,7 @@ bool findStoreVolume(Dispatch& r) {
         }
         CORV_LOG_ERR("Failed to get installation volume %s", r.wanted.c_str());
     }
-    r.pm.setResult(spaceOr(PKG_ERR_VOLUME_CHECK));
-    if (r.pm.getResult() == PKG_ERR_NO_SPACE) {
-        PMSReportNoSpace(r.pm, r.wanted, r.size + PKG_VOLUME_MARGIN, PMSFreeBytes(r.wanted));
-    }
+    refuseForSpace(r.pm, PKG_ERR_VOLUME_CHECK, r.wanted, r.size);
     return false;
 }
 

@@ -226,8 +226,7 @@ TEST(CliLifecycle, FullVolumeIsSaidInWords) {
         const char* volume;
         const char* words;  // what the code alone would not say
     } cases[] = {
-        {{"check", file}, "/volume1", "not installable: pkgmgr:broken_package"},
-        {{"install", file, "--no-verify"}, "/volume1", "pkgmgr:broken_package"},
+        {{"install", file, "--no-verify"}, "/volume1", "PKG_ERR_NO_SPACE"},
         {{"install", file, "--no-verify", "--volume", "/volume2"}, "/volume2", "PKG_ERR_NO_SPACE"},
     };
     for (const Case& c : cases) {

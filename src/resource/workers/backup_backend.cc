@@ -73,14 +73,7 @@ class BackupBackend : public CORV::PkgUtils::IWorker {
     }
     int Release(const CORV::PkgUtils::ActionInfo& /*action*/, const Json::Value& /*request*/,
                 Json::Value& own, CORV::PkgUtils::WorkerResp& /*resp*/) override {
-        const Json::Value configs = WorkerArrayOf(own, kConfigs);
-        if (!configs.isArray()) {
-            VLIBCErrSet(ERR_MALFORMED);
-            return 1;
-        }
-        WorkerUnlinkAll(kDir, configs);
-        own.removeMember(kConfigs);
-        return 0;
+        return WorkerReleaseListed(own, kConfigs, kDir);
     }
 };
 

@@ -42,5 +42,16 @@ void WorkerUnlinkAll(const std::string& dir, const Json::Value& names) {
     }
 }
 
+int WorkerReleaseListed(Json::Value& own, const char* key, const std::string& dir) {
+    const Json::Value names = WorkerArrayOf(own, key);
+    if (!names.isArray()) {
+        VLIBCErrSet(ERR_MALFORMED);
+        return 1;
+    }
+    WorkerUnlinkAll(dir, names);
+    own.removeMember(key);
+    return 0;
+}
+
 }  // namespace Resource
 }  // namespace CORVPackageTool

@@ -18,6 +18,10 @@ Json::Value WorkerArrayOf(const Json::Value& section, const char* key);
 // Unlinks <dir>/<name> for each non-empty string of `names` that is a plain file name;
 // a failure other than ENOENT is logged ("Failed to unlink %s (%m)") and sets 0x3900.
 void WorkerUnlinkAll(const std::string& dir, const Json::Value& names);
+// The release of a worker that publishes files into `dir` and lists their names under
+// `key` of its own-file: unlinks them and forgets the list. 1 with 0x4000 when the list
+// is not an array, else 0.
+int WorkerReleaseListed(Json::Value& own, const char* key, const std::string& dir);
 
 }  // namespace Resource
 }  // namespace CORVPackageTool

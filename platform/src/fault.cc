@@ -7,6 +7,7 @@
 #include <signal.h>
 #include <stdlib.h>
 #include <string.h>
+#include <sys/statvfs.h>
 #include <unistd.h>
 
 #include <string>
@@ -16,23 +17,31 @@
 
 namespace {
 
+std::string fillDir() {
+    const char* dir = getenv("CORVPKG_FAULT_FILL");
+    return dir != nullptr && *dir != '\0' ? dir : "/volume1";
+}
+
 void trace(const std::string& entry) {
     const char* path = getenv("CORVPKG_FAULT_TRACE");
     if (path == nullptr || *path == '\0') {
         return;
     }
+    struct statvfs fs {};
+    const unsigned long long freeBytes =
+        statvfs(fillDir().c_str(), &fs) == 0
+            ? static_cast<unsigned long long>(fs.f_bavail) * fs.f_frsize
+            : 0;
     corvplat::UniqueFd fd(open(path, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644));
     if (fd.get() >= 0) {
-        const std::string line = entry + "\n";
+        const std::string line = entry + "\t" + std::to_string(freeBytes) + "\n";
         (void)!write(fd.get(), line.data(), line.size());
     }
 }
 
 // Writes zeros until the file system says it is full; what is written stays.
 void fillVolume() {
-    const char* dir = getenv("CORVPKG_FAULT_FILL");
-    const std::string path =
-        std::string(dir != nullptr && *dir != '\0' ? dir : "/volume1") + "/" CORV_FAULT_FILL_FILE;
+    const std::string path = fillDir() + "/" CORV_FAULT_FILL_FILE;
     corvplat::UniqueFd fd(open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600));
     if (fd.get() < 0) {
         return;
@@ -67,10 +76,23 @@ bool CORVFaultAt(const char* road, const char* step) {
     return false;
 }
 
+int CORVFaultSeconds(const char* name, int seconds) {
+    const char* request = getenv("CORVPKG_FAULT_SECONDS");
+    const size_t length = strlen(name);
+    if (request == nullptr || strncmp(request, name, length) != 0 || request[length] != '=') {
+        return seconds;
+    }
+    return atoi(request + length + 1);
+}
+
 #else
 
 bool CORVFaultAt(const char*, const char*) {
     return false;
+}
+
+int CORVFaultSeconds(const char*, int seconds) {
+    return seconds;
 }
 
 #endif

@@ -6,6 +6,7 @@
 #include <string>
 
 #include "catalogue/pkginfo_private.h"
+#include "corv/fault.h"
 #include "corv/log.h"
 #include "corv/process_runner.h"
 #include "corv/service.h"
@@ -130,7 +131,7 @@ bool PackageManager::getServiceStatus(const std::string& name, bool& running, bo
     }
     if (askScript) {
         CORVUtils::ProcessRunner runner(script, {"status"});
-        runner.setTimeout(kScriptTimeoutSeconds);
+        runner.setTimeout(CORVFaultSeconds("status-script", kScriptTimeoutSeconds));
         PMSPrepareScriptEnv(info, runner, nullptr, nullptr, static_cast<PKG_INSTALLATION_TYPE>(0),
                             nullptr, nullptr, nullptr, nullptr);
         if (!Privilege::SetIdentity(runner, name, "status", "")) {
@@ -252,7 +253,7 @@ std::string PackageManager::getPackageLog(const std::string& name, bool quiet) {
         return "";
     }
     CORVUtils::ProcessRunner runner(script, {"log"});
-    runner.setTimeout(kScriptTimeoutSeconds);
+    runner.setTimeout(CORVFaultSeconds("status-script", kScriptTimeoutSeconds));
     PMSPrepareScriptEnv(info, runner, nullptr, nullptr, static_cast<PKG_INSTALLATION_TYPE>(0),
                         nullptr, nullptr, nullptr, nullptr);
     if (!Privilege::SetIdentity(runner, name, "log", "")) {

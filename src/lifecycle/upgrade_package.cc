@@ -71,7 +71,7 @@ struct UpgradeRoad {
 // another file system may refuse some entries for a while (busy files).
 bool copyPayload(UpgradeRoad& r, const std::string& work, const std::string& dest) {
     for (int attempt = 0; attempt < kCopyTries; ++attempt) {
-        sleep(1);
+        sleep(static_cast<unsigned>(CORVFaultSeconds("copy-pause", 1)));
         CORVUtils::ProcessRunner cp("/bin/sh",
                                     {"-c", "/bin/cp -arf " + work + "/package/* " + dest});
         if (PMSRunAndWriteScriptLog(r.newInfo, kUpgrade, cp, -1) == 0) {

@@ -2,6 +2,7 @@
 // resources, the repair's fallback, a payload that only copies, and the first boot after an
 // OS upgrade. In the sandbox.
 #include <gtest/gtest.h>
+#include <stdlib.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -163,7 +164,10 @@ exec /usr/bin/cp.real "$@"
     chmod("/usr/bin/mv", 0755);
     chmod("/usr/bin/cp", 0755);
     PackageManager upgrade;
+    // The tries are a second apart; here they follow each other at once.
+    setenv("CORVPKG_FAULT_SECONDS", "copy-pause=0", 1);
     EXPECT_EQ(installFile(upgrade, file, "/volume1"), 1) << upgrade.getResult();
+    unsetenv("CORVPKG_FAULT_SECONDS");
     EXPECT_EQ(testutil::readFile("/tmp/cp.calls"), std::string(30, '\n'));
     EXPECT_EQ(testutil::readFile("/volume1/@appstore/demo/bin/app"),
               "#!/bin/sh\necho app 2.0-0001\n");

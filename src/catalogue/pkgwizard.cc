@@ -217,14 +217,18 @@ void getUIDefaultValues(Json::Value ui, Json::Value& values) {
     collectDefaults(ui, values);
 }
 
-bool PackageManager::parseUIFile(const std::string& cpkFile, const std::string& dir,
-                                 PKG_INSTALLATION_TYPE type, PackageInfo& info,
-                                 const char* language) {
+namespace {
+
+// The first candidate that gives steps wins. With `extracted`, every candidate the file
+// has is in `dir` already, and a missing one is not asked of tar again: each tar run
+// reads through the whole package file.
+void findWizard(const std::string& cpkFile, const std::string& dir, PKG_INSTALLATION_TYPE type,
+                PackageInfo& info, const char* language, bool extracted) {
     for (const std::string& candidate : PMSUIFileCandidates(language, type)) {
         // A file that the caller took out already is not extracted a second time.
         std::string path = dir + "/" + candidate;
         if (!VLIBCFileExist(path.c_str()) &&
-            !PMSExtractUIFile(cpkFile.c_str(), dir.c_str(), candidate, path)) {
+            (extracted || !PMSExtractUIFile(cpkFile.c_str(), dir.c_str(), candidate, path))) {
             continue;
         }
         readCandidate(info, cpkFile.c_str(), path, language, type, info.wizard);
@@ -232,6 +236,14 @@ bool PackageManager::parseUIFile(const std::string& cpkFile, const std::string& 
             break;
         }
     }
+}
+
+}  // namespace
+
+bool PackageManager::parseUIFile(const std::string& cpkFile, const std::string& dir,
+                                 PKG_INSTALLATION_TYPE type, PackageInfo& info,
+                                 const char* language) {
+    findWizard(cpkFile, dir, type, info, language, false);
     // A package without a wizard, or with a broken one, goes on without one.
     return true;
 }
@@ -274,7 +286,8 @@ bool PackageManager::queryPackageFileInfoWithWizard(const std::string& cpkFile, 
         CORV_LOG_ERR("Failed to read license file LICENSE in %s", cpkFile.c_str());
         return false;
     }
-    return parseUIFile(cpkFile, tmp, type, info, language);
+    findWizard(cpkFile, tmp, type, info, language, true);
+    return true;
 }
 
 bool PackageManager::readUIFile(PKG_INSTALLATION_TYPE type, const std::string& name,

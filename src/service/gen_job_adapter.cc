@@ -4,10 +4,11 @@
 #include <string.h>
 #include <unistd.h>
 
-#include <fstream>
 #include <ostream>
+#include <sstream>
 #include <string>
 
+#include "corv/file_replace.h"
 #include "corv/log.h"
 #include "corv/service.h"
 #include "corv/vlibc.h"
@@ -94,27 +95,10 @@ bool JobAdapter::ToFile(const std::string& path) const {
         VLIBCErrSet(ERR_CHOWN_FAILED);
         return false;
     }
-    char tmp[4096];
-    if (!CreateTmpFile(path, tmp, sizeof(tmp))) {
-        return false;
-    }
-    {
-        std::ofstream out(tmp, std::ios::out | std::ios::trunc);
-        if (!out) {
-            VLIBCErrSet(ERR_OPEN_FAILED);
-            unlink(tmp);
-            return false;
-        }
-        Write(out);
-    }
+    std::ostringstream text;
+    Write(text);
     // One rename, so a reader of the job sees the old text or the new, never a mix.
-    if (rename(tmp, path.c_str()) != 0) {
-        CORV_LOG_ERR("Failed to rename %s to %s (%m)", tmp, path.c_str());
-        VLIBCErrSet(ERR_RENAME_FAILED);
-        unlink(tmp);
-        return false;
-    }
-    return true;
+    return CORVFileReplace(path, text.str(), 0644);
 }
 
 namespace {

@@ -5,6 +5,7 @@
 #include <set>
 #include <string>
 
+#include "corv/file_replace.h"
 #include "corv/log.h"
 #include "corv/service.h"
 #include "corv/vlibc.h"
@@ -18,28 +19,14 @@ namespace {
 
 // Validated before it gets its name, so the service layer never reads a file it refuses.
 bool WriteServiceCfgFile(const std::string& path, const Json::Value& cfg) {
-    char tmp[4096];
-    if (!CreateTmpFile(path, tmp, sizeof(tmp))) {
-        return false;
-    }
-    bool ok = false;
-    if (!toFile(cfg, tmp)) {
-        CORV_LOG_ERR("Failed to write %s (%m)", tmp);
-        VLIBCErrSet(ERR_WRITE_FAILED);
-    } else if (VLIBServicecfgValidate(tmp) < 0) {
-        CORV_LOG_ERR("Invalid %s[0x%04X %s:%d]", tmp, VLIBCErrGet(), VLIBCErrorGetFile(),
-                     VLIBCErrorGetLine());
-    } else if (rename(tmp, path.c_str()) != 0) {
-        CORV_LOG_ERR("Failed to rename %s to %s (%m)", tmp, path.c_str());
-        VLIBCErrSet(ERR_RENAME_FAILED);
-    } else {
-        ok = true;
-        if (chmod(path.c_str(), 0644) != 0) {
-            CORV_LOG_ERR("chmod failed for '%s' (%m)", path.c_str());
+    return CORVFileReplace(path, toString(cfg), 0644, [](const char* written) {
+        if (VLIBServicecfgValidate(written) < 0) {
+            CORV_LOG_ERR("Invalid %s[0x%04X %s:%d]", written, VLIBCErrGet(), VLIBCErrorGetFile(),
+                         VLIBCErrorGetLine());
+            return false;
         }
-    }
-    unlink(tmp);
-    return ok;
+        return true;
+    });
 }
 
 }  // namespace

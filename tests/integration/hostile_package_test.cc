@@ -202,3 +202,22 @@ TEST(HostilePackage, NamedPipeInfoNeverBlocksTheCommandLine) {
     }
     alarm(0);
 }
+
+TEST(HostilePackage, PayloadArchiveThatIsNoRegularFileIsABadPackage) {
+    alarm(90);
+    const std::string file = testutil::buildPackage(testutil::recordingPackage("demo"));
+    replaceMember(file, "package.tgz", namedPipe);
+    const std::vector<std::vector<std::string>> commands = {{"check", file},
+                                                            {"install", file, "--no-verify"}};
+    for (const auto& args : commands) {
+        testutil::RunResult r = testutil::run(CORVPKG_CLI_PATH, args);
+        EXPECT_EQ(r.status, 1) << args[0] << ": " << r.out << r.err;
+        EXPECT_NE((r.out + r.err).find("PKG_ERR_BAD_ARCHIVE"), std::string::npos)
+            << args[0] << ": " << r.out << r.err;
+    }
+    testutil::RunResult inspect = testutil::run(CORVPKG_CLI_PATH, {"inspect", file});
+    EXPECT_NE(inspect.out.find("payload:       CHECKSUM WRONG"), std::string::npos)
+        << inspect.out << inspect.err;
+    EXPECT_FALSE(testutil::exists("/var/packages/demo"));
+    alarm(0);
+}

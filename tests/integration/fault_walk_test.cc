@@ -1,8 +1,8 @@
 // Every named step of install, upgrade, uninstall, start and stop, interrupted there: the
-// process killed, or the volume full. Whatever is left, the registry reads, the lock is
-// free, the package next to it is untouched, and one more install of the same file brings
-// the package back. The steps come from the roads themselves (CORVPKG_FAULT_TRACE), so a
-// step added to a road is walked without a word here.
+// step failed, the process killed, or the volume full. Whatever is left, the registry
+// reads, the lock is free, the package next to it is untouched, and one more install of the
+// same file brings the package back. The steps come from the roads themselves
+// (CORVPKG_FAULT_TRACE), so a step added to a road is walked without a word here.
 #include <gtest/gtest.h>
 #include <stdlib.h>
 #include <sys/wait.h>
@@ -54,9 +54,11 @@ struct Road {
     const char* name;
     bool runningBefore;
     std::vector<std::string> (*command)(const std::string& v1, const std::string& v2);
-    bool upgradeFile;      // the command installs v2, and so does the recovery
-    bool eitherEndIsFine;  // start/stop: an interrupted change of intent may have taken hold
-    int shards;            // the walk is cut in this many tests, each of bearable length
+    bool upgradeFile;  // the command installs v2, and so does the recovery
+    // Start and stop are killed at every step inside the upgrade and the uninstall, where
+    // the running state to come back to is known; on their own they are only failed.
+    bool killed;
+    int shards;  // the walk is cut in this many tests, each of bearable length
     std::set<std::string> leftStopped;
 };
 
@@ -88,14 +90,14 @@ const Road kRoads[] = {
      [](auto& v1, auto&) {
          return std::vector<std::string>{"install", v1};
      },
-     false, false, 2, with(kBeforeEnabled, {"install:start"})},
+     false, true, 2, with(kBeforeEnabled, {"install:start"})},
     {"upgrade",
      true,
      [](auto&, auto& v2) {
          return std::vector<std::string>{"install", v2};
      },
      true,
-     false,
+     true,
      4,
      {}},
     // An uninstall stops the package for good (no pause, no flag) before its preuninst;
@@ -106,7 +108,7 @@ const Road kRoads[] = {
          return std::vector<std::string>{"uninstall", "demo"};
      },
      false,
-     false,
+     true,
      2,
      {"stop:restart-related-services", "stop:close-task", "stop:keep-store-linux-mode",
       "stop:log-outcome", "stop:run-hooks", "uninstall:run-preuninst",
@@ -117,7 +119,7 @@ const Road kRoads[] = {
          return std::vector<std::string>{"stop", "demo"};
      },
      false,
-     true,
+     false,
      1,
      {}},
     {"start",
@@ -126,7 +128,7 @@ const Road kRoads[] = {
          return std::vector<std::string>{"start", "demo"};
      },
      false,
-     true,
+     false,
      1,
      {}},
 };
@@ -147,9 +149,25 @@ std::vector<Walk> walks() {
     return out;
 }
 
+// A step the command passed through, and whether the room on the volume changed while it
+// ran (it wrote or removed files there).
+struct Step {
+    std::string name;
+    bool roomChanged;
+};
+
+bool startsWith(const std::string& text, const std::string& prefix) {
+    return text.rfind(prefix, 0) == 0;
+}
+
 class FaultWalk : public ::testing::TestWithParam<Walk> {
   protected:
     void SetUp() override {
+        const std::string test = ::testing::UnitTest::GetInstance()->current_test_info()->name();
+        if (startsWith(test, "VolumeFull") && road().name != std::string("install") &&
+            road().name != std::string("upgrade")) {
+            GTEST_SKIP() << "nothing of size is written";
+        }
         v1_ = testutil::buildPackage(testutil::recordingPackage("demo", "1.0-0001"));
         v2_ = testutil::buildPackage(testutil::recordingPackage("demo", "2.0-0001"));
         ASSERT_EQ(corvpkg({"install", testutil::buildPackage(testutil::recordingPackage("other")),
@@ -159,11 +177,15 @@ class FaultWalk : public ::testing::TestWithParam<Walk> {
     }
 
     const Road& road() const { return *GetParam().road; }
+    bool ownStep(const std::string& step) const {
+        return startsWith(step, road().name + std::string(":"));
+    }
 
     std::string recoveryFile() const { return road().upgradeFile ? v2_ : v1_; }
 
     // The package installed (v1, or v2 once an upgrade went through) and running or not.
-    void bringToStart() {
+    // A package left broken is repaired by an install of the file on the way.
+    void bringToStart(bool afterFailure = false) {
         const Road& road = this->road();
         if (road.name == std::string("install")) {
             if (status("demo") != 255) {
@@ -173,10 +195,25 @@ class FaultWalk : public ::testing::TestWithParam<Walk> {
         }
         if (status("demo") == 255) {
             ASSERT_EQ(corvpkg({"install", v1_, "--no-verify"}).status, 0);
+        } else if (status("demo") == 150) {
+            testutil::RunResult r = corvpkg({"install", recoveryFile(), "--no-verify"});
+            ASSERT_EQ(r.status, 0) << "the broken package is not repaired: " << r.out << r.err;
         }
         if ((status("demo") == 0) != road.runningBefore) {
-            ASSERT_EQ(corvpkg({road.runningBefore ? "start" : "stop", "demo"}).status, 0);
+            testutil::RunResult r = corvpkg({road.runningBefore ? "start" : "stop", "demo"});
+            // A road that failed after it gave back the package's running resources (an
+            // uninstall goes forward once they are released) leaves a package that only a
+            // new install of its file makes whole; the uninstall had stopped it for good.
+            if (r.status != 0 && afterFailure && road.runningBefore) {
+                r = corvpkg({"install", recoveryFile(), "--no-verify"});
+                ASSERT_EQ(r.status, 0) << "no repair: " << r.out << r.err;
+                if (status("demo") != 0) {
+                    r = corvpkg({"start", "demo"});
+                }
+            }
+            ASSERT_EQ(r.status, 0) << r.out << r.err;
         }
+        ASSERT_EQ(status("demo") == 0, road.runningBefore) << status("demo");
     }
 
     std::vector<std::string> command() const {
@@ -187,21 +224,40 @@ class FaultWalk : public ::testing::TestWithParam<Walk> {
         return args;
     }
 
-    // The road:step names the command passes through, in order, each once.
-    std::vector<std::string> steps() {
+    // The road:step names the command passes through, in order, each once; this test's
+    // share of them.
+    std::vector<Step> steps() {
         bringToStart();
         testutil::removeAll(kTrace);
         setenv("CORVPKG_FAULT_TRACE", kTrace, 1);
         testutil::RunResult r = corvpkg(command());
         unsetenv("CORVPKG_FAULT_TRACE");
         EXPECT_EQ(r.status, 0) << r.err;
-        std::vector<std::string> out;
-        std::set<std::string> seen;
+        std::vector<std::pair<std::string, std::string>> entries;  // name, free bytes on entry
         std::istringstream lines(testutil::readFile(kTrace));
         for (std::string line; std::getline(lines, line);) {
-            if (seen.insert(line).second &&
-                seen.size() % road().shards == size_t(GetParam().shard)) {
-                out.push_back(line);
+            const size_t tab = line.find('\t');
+            entries.emplace_back(line.substr(0, tab),
+                                 tab == std::string::npos ? "" : line.substr(tab + 1));
+        }
+        // The dispatcher's steps before it picks the upgrade are those of every install,
+        // walked with the fresh one.
+        size_t first = 0;
+        if (road().name == std::string("upgrade")) {
+            while (first < entries.size() && !ownStep(entries[first].first)) {
+                ++first;
+            }
+        }
+        std::vector<Step> out;
+        std::set<std::string> seen;
+        for (size_t i = first; i < entries.size(); ++i) {
+            const bool changed =
+                i + 1 == entries.size() || entries[i + 1].second != entries[i].second;
+            if (!seen.insert(entries[i].first).second) {
+                continue;
+            }
+            if (seen.size() % road().shards == size_t(GetParam().shard)) {
+                out.push_back({entries[i].first, changed});
             }
         }
         return out;
@@ -225,48 +281,77 @@ class FaultWalk : public ::testing::TestWithParam<Walk> {
         EXPECT_EQ(version("demo"), road().upgradeFile ? "2.0-0001" : "1.0-0001");
         const int after = status("demo");
         const bool running = road().runningBefore || road().name == std::string("install");
-        if (road().eitherEndIsFine || road().leftStopped.count(step)) {
+        if (road().leftStopped.count(step)) {
             EXPECT_TRUE(after == 0 || after == 3) << after;
         } else {
             EXPECT_EQ(after, running ? 0 : 3) << "running state after the recovery";
         }
     }
 
+    // A step of the road itself that fails gives a clean failure (or, for a step whose
+    // failure the road only notes, a success), and the road can be gone again.
+    void failAt(const std::string& step) {
+        testutil::RunResult r = corvpkg(command(), step + ":fail");
+        EXPECT_TRUE(r.status == 0 || r.status == 1) << r.out << r.err;
+        expectConsistent();
+    }
+
+    // Start and stop, on their own: the same command again, without a fault, does what
+    // was asked.
+    void expectRepeatable() {
+        testutil::RunResult r = corvpkg(command());
+        EXPECT_EQ(r.status, 0) << r.out << r.err;
+        EXPECT_EQ(status("demo"), road().runningBefore ? 3 : 0);
+    }
+
     std::string v1_;
     std::string v2_;
 };
 
-TEST_P(FaultWalk, KilledAtEveryStep) {
-    const std::vector<std::string> walk = steps();
+// Each step fails first; what the failure leaves is brought back to where the road starts
+// (an uninstall, a repair, a start or stop), then the same step is killed.
+TEST_P(FaultWalk, FailedAndKilledAtEveryStep) {
+    const std::vector<Step> walk = steps();
     ASSERT_GT(walk.size(), 3u);
-    for (const std::string& step : walk) {
-        SCOPED_TRACE(step);
+    for (const Step& step : walk) {
+        SCOPED_TRACE(step.name);
         bringToStart();
-        testutil::RunResult r = corvpkg(command(), step + ":kill");
+        if (ownStep(step.name) || startsWith(step.name, "dispatch:")) {
+            failAt(step.name);
+            if (!road().killed) {
+                expectRepeatable();
+                continue;
+            }
+            bringToStart(true);
+        }
+        if (!road().killed) {
+            continue;
+        }
+        testutil::RunResult r = corvpkg(command(), step.name + ":kill");
         EXPECT_EQ(r.status, kKilled) << r.out << r.err;
         expectConsistent();
-        expectRecovery(step);
+        expectRecovery(step.name);
     }
 }
 
-// The roads that write the payload; the steps of the roads they call on the way are filled
-// up in their own walk.
+// The roads that write the payload, filled up at their own steps that take or give back
+// room: between two of those a full volume meets the same writes. The steps of the roads
+// they call on the way are filled up in their own walk.
 TEST_P(FaultWalk, VolumeFullAtEveryStep) {
-    if (road().name != std::string("install") && road().name != std::string("upgrade")) {
-        GTEST_SKIP() << "nothing of size is written";
-    }
-    for (const std::string& step : steps()) {
-        if (step.rfind(road().name + std::string(":"), 0) != 0) {
+    bool first = true;
+    for (const Step& step : steps()) {
+        if (!ownStep(step.name) || (!first && !step.roomChanged)) {
             continue;
         }
-        SCOPED_TRACE(step);
+        first = false;
+        SCOPED_TRACE(step.name);
         bringToStart();
-        testutil::RunResult r = corvpkg(command(), step + ":fill");
+        testutil::RunResult r = corvpkg(command(), step.name + ":fill");
         ASSERT_TRUE(testutil::exists(kFiller)) << "the volume was not filled";
         testutil::removeAll(kFiller);
         EXPECT_TRUE(r.status == 0 || r.status == 1) << r.out << r.err;
         expectConsistent();
-        expectRecovery(step);
+        expectRecovery(step.name);
     }
 }
 

@@ -60,6 +60,8 @@ struct Road {
     bool killed;
     int shards;  // the walk is cut in this many tests, each of bearable length
     std::set<std::string> leftStopped;
+    // Steps killed in another road, where what the kill must leave is told more sharply.
+    std::set<std::string> walkedElsewhere = {};
 };
 
 // A fresh install removes `installing` before it starts the package, and the start writes
@@ -80,17 +82,19 @@ const std::set<std::string> kBeforeEnabled = {"start:open-task",
                                               "start:mark-enabled",
                                               "start:change-intent"};
 
-std::set<std::string> with(std::set<std::string> steps, const std::set<std::string>& more) {
-    steps.insert(more.begin(), more.end());
-    return steps;
-}
-
 const Road kRoads[] = {
-    {"install", false,
+    {"install",
+     false,
      [](auto& v1, auto&) {
          return std::vector<std::string>{"install", v1};
      },
-     false, true, 2, with(kBeforeEnabled, {"install:start"})},
+     false,
+     true,
+     2,
+     {"install:start"},
+     // Inside a fresh install a crash before `enabled` may end either way; the upgrade
+     // kills the same steps with the package's running state to come back to.
+     kBeforeEnabled},
     {"upgrade",
      true,
      [](auto&, auto& v2) {
@@ -253,7 +257,8 @@ class FaultWalk : public ::testing::TestWithParam<Walk> {
         for (size_t i = first; i < entries.size(); ++i) {
             const bool changed =
                 i + 1 == entries.size() || entries[i + 1].second != entries[i].second;
-            if (!seen.insert(entries[i].first).second) {
+            if (road().walkedElsewhere.count(entries[i].first) ||
+                !seen.insert(entries[i].first).second) {
                 continue;
             }
             if (seen.size() % road().shards == size_t(GetParam().shard)) {

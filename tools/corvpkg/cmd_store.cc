@@ -3,6 +3,7 @@
 #include <string.h>
 
 #include <string>
+#include <utility>
 
 #include "cli.h"
 #include "corv/vlibc.h"
@@ -59,7 +60,7 @@ int storeList(const Command& self, const std::vector<std::string>& args) {
     }
     if (opts.json) {
         Json::Value out(Json::objectValue);
-        out["packages"] = list;
+        out["packages"] = std::move(list);
         out["errors"] = errors;
         printf("%s\n", toString(out).c_str());
         return EXIT_OK;

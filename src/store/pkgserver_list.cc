@@ -245,9 +245,9 @@ bool CORVPackageServer::PMSQueryCorvPkgServer(bool force, const char* language, 
 }
 
 void PMSMergeFeedEntries(const std::unordered_set<std::string>& makerNames, const std::string& feed,
-                         const Json::Value& entries, Json::Value& out,
+                         Json::Value entries, Json::Value& out,
                          std::unordered_map<std::string, Json::ArrayIndex>& index) {
-    for (const Json::Value& entry : entries) {
+    for (Json::Value& entry : entries) {
         if (!hasText(entry, "package") || !hasText(entry, "version")) {
             continue;
         }
@@ -256,7 +256,8 @@ void PMSMergeFeedEntries(const std::unordered_set<std::string>& makerNames, cons
         if (makerNames.count(name) != 0) {
             continue;
         }
-        Json::Value taken = entry;
+        const std::string version = entry["version"].asString();
+        Json::Value taken = std::move(entry);
         taken["feed"] = feed;
         auto it = index.find(name);
         if (it == index.end()) {
@@ -264,7 +265,7 @@ void PMSMergeFeedEntries(const std::unordered_set<std::string>& makerNames, cons
             out.append(std::move(taken));
             continue;
         }
-        PackageBasicInfo candidate(name, entry["version"].asString());
+        PackageBasicInfo candidate(name, version);
         PackageBasicInfo present(name, out[it->second]["version"].asString());
         if (candidate.compare(present, PKG_COMPOP_GT)) {
             out[it->second] = std::move(taken);
@@ -288,15 +289,15 @@ bool queryFeed(const char* language, const std::string& feed, Json::Value& data)
 }
 
 // The entries and keys of a feed's reply; false for a reply of another shape.
-bool feedEntries(const Json::Value& data, Json::Value& entries, Json::Value& keys) {
+bool feedEntries(Json::Value& data, Json::Value& entries, Json::Value& keys) {
     if (data.isArray()) {
-        entries = data;
+        entries = std::move(data);
         return true;
     }
     if (!isList(data)) {
         return false;
     }
-    entries = data["packages"];
+    entries = std::move(data["packages"]);
     if (data.isMember("keyrings") && data["keyrings"].isArray() && !data["keyrings"].empty()) {
         keys = data["keyrings"];
     }
@@ -374,7 +375,7 @@ bool CORVPackageServer::PMSQueryOtherPkgServer(bool force, const char* language,
             continue;
         }
         PMSUpdatePkgServerKey(feed, keys);
-        PMSMergeFeedEntries(makerNames, feed, entries, out, index);
+        PMSMergeFeedEntries(makerNames, feed, std::move(entries), out, index);
     }
     if (!cache.empty() && !toFile(out, cache)) {
         CORV_LOG_ERR("Fail to save %s, %m", cache.c_str());

@@ -27,7 +27,7 @@ bool PMSSortPackageArray(Json::Value& array);
 // through `index`, name to position) is replaced only by a greater version. Each entry
 // taken gets "feed": `feed`.
 void PMSMergeFeedEntries(const std::unordered_set<std::string>& makerNames, const std::string& feed,
-                         const Json::Value& entries, Json::Value& out,
+                         Json::Value entries, Json::Value& out,
                          std::unordered_map<std::string, Json::ArrayIndex>& index);
 
 // Parses a store reply; a reply that is not JSON is logged with the parser's messages and

@@ -8,6 +8,10 @@
 
 #include "corvpkg/pkginfo.h"
 
+namespace Json {
+class Value;
+}
+
 namespace CORVPackageTool {
 
 class PackageBasicInfoExtraPrivate {};
@@ -71,6 +75,10 @@ void PMSParseOSVersion(const char* text, int out[3]);
 // directory, most specific first: "WIZARD_UIFILES/<base>_<lang>.sh", "<base>.sh",
 // "<base>_<lang>", "<base>". Without a language the two with one are left out.
 std::vector<std::string> PMSUIFileCandidates(const char* language, PKG_INSTALLATION_TYPE type);
+
+// The dependencies of a store entry, as PMSMapJsonToPackageInfo reads them into
+// dep_packages; nothing for an entry that is not an object.
+void PMSMapJsonDependencies(const Json::Value& entry, DepPkgVector& deps);
 
 constexpr const char* kPackageNameForbidden = ":/<>=|";
 constexpr const char* kUIDirNameForbidden = ":/";

@@ -44,14 +44,21 @@ bool PMSMapJsonToPackageInfo(const Json::Value& entry, PackageInfo& info) {
     } else if (entry.isMember("conflictpkgs") && entry["conflictpkgs"].isString()) {
         PMSExplodeDepPKGString(entry["conflictpkgs"].asCString(), info.conflict_packages);
     }
+    PMSMapJsonDependencies(entry, info.dep_packages);
+    return true;
+}
+
+void PMSMapJsonDependencies(const Json::Value& entry, DepPkgVector& deps) {
+    if (!entry.isObject()) {
+        return;
+    }
     if (entry.isMember("conf_deppkgs")) {
-        PMSParseDepJSON(entry["conf_deppkgs"], info.dep_packages);
+        PMSParseDepJSON(entry["conf_deppkgs"], deps);
     } else if (entry.isMember("deppkgs") && hasText(entry, "deppgs")) {
         // The test names "deppgs", as it always has: stores send dependencies as
         // "conf_deppkgs", and an entry with only "deppkgs" has never added any.
-        PMSExplodeDepPKGString(jsonText(entry, "deppkgs", "").c_str(), info.dep_packages);
+        PMSExplodeDepPKGString(jsonText(entry, "deppkgs", "").c_str(), deps);
     }
-    return true;
 }
 
 }  // namespace CORVPackageTool

@@ -39,6 +39,12 @@ bool PMSReadRegularFile(const std::string& path, std::string& content) {
         return false;
     }
     std::string data;
+    // Sized once: a store's list is megabytes, and each regrowth copies it and touches
+    // fresh pages.
+    struct stat st {};
+    if (fstat(fd.get(), &st) == 0 && st.st_size > 0) {
+        data.reserve(static_cast<size_t>(st.st_size));
+    }
     char block[65536];
     for (;;) {
         ssize_t n = VLIBCRead(fd.get(), block, sizeof(block));

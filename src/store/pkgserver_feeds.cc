@@ -125,14 +125,14 @@ bool CORVPackageServer::PMSGetAllPkgList(bool force, const char* language, Json:
     if (language == nullptr) {
         return false;
     }
-    Json::Value maker, feeds, all(Json::arrayValue);
+    Json::Value maker, feeds;
     const bool makerOk = PMSQueryCorvPkgServer(force, language, maker);
     if (makerOk) {
-        for (const Json::Value& entry : maker["packages"]) {
-            Json::Value item = entry;
-            if (item.isObject()) {
-                item["source"] = "maker";
-                all.append(std::move(item));
+        // Entries move, never copy: the lists are megabytes of JSON.
+        for (Json::Value& entry : maker["packages"]) {
+            if (entry.isObject()) {
+                entry["source"] = "maker";
+                out.append(std::move(entry));
             }
         }
     } else {
@@ -143,14 +143,13 @@ bool CORVPackageServer::PMSGetAllPkgList(bool force, const char* language, Json:
     if (feedsOk) {
         for (Json::Value& entry : feeds) {
             entry["source"] = jsonText(entry, "feed", "");
-            all.append(std::move(entry));
+            out.append(std::move(entry));
         }
     } else if (makerOk) {
         noteError(errors, "feeds", Json::Value());
     }
-    if (!PMSSortPackageArray(all, out)) {
+    if (!PMSSortPackageArray(out)) {
         CORV_LOG_ERR("Failed to sort packages");
-        out = std::move(all);
     }
     return makerOk || feedsOk;
 }

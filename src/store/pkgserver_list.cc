@@ -12,6 +12,7 @@
 #include <unordered_map>
 #include <unordered_set>
 
+#include "catalogue/pkginfo_private.h"
 #include "corv/log.h"
 #include "corvpkg/json_util.h"
 #include "corvpkg/packagemanager.h"
@@ -91,23 +92,31 @@ std::string PMSListCachePath(const char* prefix, const char* language) {
 
 namespace {
 
+// What the sort reads of an entry: its name and the names of what it depends on. A full
+// PackageInfo per entry costs more than all the rest of a list of thousands.
+struct SortKey {
+    std::string package;
+    std::vector<std::string> needs;
+};
+
 // The order of the dependency graph's topological sort (dependents first; among the
 // packages whose dependencies are all placed, the one listed first goes to the latest free
 // place; of two records of one name the later takes the name's edges), computed with a
 // heap instead of the graph's dense matrix, whose cost grows with the cube of the count:
 // a store lists thousands of packages. False on a cycle.
-bool dependentsFirst(const std::vector<PackageInfo>& infos, std::vector<std::string>& order) {
-    const size_t count = infos.size();
+bool dependentsFirst(const std::vector<SortKey>& keys, std::vector<std::string>& order) {
+    const size_t count = keys.size();
     std::unordered_map<std::string, size_t> vertex;
+    vertex.reserve(count);
     for (size_t i = 0; i < count; ++i) {
-        vertex[infos[i].package] = i;
+        vertex[keys[i].package] = i;
     }
     std::vector<std::vector<size_t>> dependents(count);
     std::vector<size_t> open(count, 0);  // dependencies not placed yet
     for (size_t i = 0; i < count; ++i) {
         std::unordered_set<size_t> seen;
-        for (const PackageBasicInfo& dep : infos[i].dep_packages) {
-            auto it = vertex.find(dep.package);
+        for (const std::string& dep : keys[i].needs) {
+            auto it = vertex.find(dep);
             if (it != vertex.end() && seen.insert(it->second).second) {
                 dependents[it->second].push_back(i);
                 ++open[i];
@@ -125,7 +134,7 @@ bool dependentsFirst(const std::vector<PackageInfo>& infos, std::vector<std::str
     while (!ready.empty()) {
         const size_t v = ready.top();
         ready.pop();
-        order[--free] = infos[v].package;
+        order[--free] = keys[v].package;
         for (size_t dependent : dependents[v]) {
             if (--open[dependent] == 0) {
                 ready.push(dependent);
@@ -135,41 +144,62 @@ bool dependentsFirst(const std::vector<PackageInfo>& infos, std::vector<std::str
     return free == 0;
 }
 
+// The sort keys of the array's entries; false at the first entry that is not an object.
+bool sortKeys(const Json::Value& array, std::vector<SortKey>& keys) {
+    keys.reserve(array.size());
+    for (const Json::Value& entry : array) {
+        if (!entry.isObject()) {
+            CORV_LOG_ERR("Format Error: jsData is not json object");
+            return false;
+        }
+        DepPkgVector deps;
+        PMSMapJsonDependencies(entry, deps);
+        SortKey key{jsonText(entry, "package", ""), {}};
+        key.needs.reserve(deps.size());
+        for (PackageBasicInfo& dep : deps) {
+            key.needs.push_back(std::move(dep.package));
+        }
+        keys.push_back(std::move(key));
+    }
+    return true;
+}
+
 }  // namespace
 
-bool PMSSortPackageArray(const Json::Value& array, Json::Value& sorted) {
+bool PMSSortPackageArray(Json::Value& array) {
     if (!array.isArray()) {
         return false;
     }
-    std::vector<Json::Value> entries(array.begin(), array.end());
-    std::vector<PackageInfo> infos(entries.size());
-    for (size_t i = 0; i < entries.size(); ++i) {
-        if (!PMSMapJsonToPackageInfo(entries[i], infos[i])) {
-            return false;
-        }
-    }
+    std::vector<SortKey> keys;
     std::vector<std::string> order;
-    if (!dependentsFirst(infos, order)) {
-        CORV_LOG_ERR("Cycle among the %zu packages of the list", infos.size());
+    if (!sortKeys(array, keys)) {
+        return false;
+    }
+    if (!dependentsFirst(keys, order)) {
+        CORV_LOG_ERR("Cycle among the %zu packages of the list", keys.size());
         return false;
     }
     // The order lists dependents first; reversed, each package comes after what it needs.
     std::unordered_map<std::string, size_t> rank;
+    rank.reserve(order.size());
     for (size_t i = 0; i < order.size(); ++i) {
         rank[order[order.size() - 1 - i]] = i;
     }
-    std::vector<std::pair<size_t, size_t>> keyed;  // rank, position
-    keyed.reserve(entries.size());
-    for (size_t i = 0; i < entries.size(); ++i) {
-        auto it = rank.find(infos[i].package);
-        keyed.emplace_back(it == rank.end() ? 0 : it->second, i);
+    std::vector<std::pair<size_t, Json::Value*>> keyed;  // rank, entry
+    keyed.reserve(keys.size());
+    size_t position = 0;
+    for (Json::Value& entry : array) {
+        auto it = rank.find(keys[position++].package);
+        keyed.emplace_back(it == rank.end() ? 0 : it->second, &entry);
     }
     std::sort(keyed.begin(), keyed.end(),
               [](const auto& a, const auto& b) { return a.first < b.first; });
-    sorted = Json::Value(Json::arrayValue);
+    // The entries move into their new places: a store's list is megabytes of JSON.
+    Json::Value sorted(Json::arrayValue);
     for (const auto& item : keyed) {
-        sorted.append(std::move(entries[item.second]));
+        sorted.append(std::move(*item.second));
     }
+    array.swap(sorted);
     return true;
 }
 
@@ -207,22 +237,17 @@ bool CORVPackageServer::PMSQueryCorvPkgServer(bool force, const char* language, 
             CORV_LOG_ERR("Fail to save %s, %m", cache.c_str());
         }
     }
-    if (sort) {
-        Json::Value sorted;
-        if (PMSSortPackageArray(result["packages"], sorted)) {
-            result["packages"] = std::move(sorted);
-        } else {
-            CORV_LOG_ERR("Failed to sort packages");
-        }
+    if (sort && !PMSSortPackageArray(result["packages"])) {
+        CORV_LOG_ERR("Failed to sort packages");
     }
     out = std::move(result);
     return true;
 }
 
 void PMSMergeFeedEntries(const std::unordered_set<std::string>& makerNames, const std::string& feed,
-                         const Json::Value& entries, Json::Value& out,
+                         Json::Value entries, Json::Value& out,
                          std::unordered_map<std::string, Json::ArrayIndex>& index) {
-    for (const Json::Value& entry : entries) {
+    for (Json::Value& entry : entries) {
         if (!hasText(entry, "package") || !hasText(entry, "version")) {
             continue;
         }
@@ -231,7 +256,8 @@ void PMSMergeFeedEntries(const std::unordered_set<std::string>& makerNames, cons
         if (makerNames.count(name) != 0) {
             continue;
         }
-        Json::Value taken = entry;
+        const std::string version = entry["version"].asString();
+        Json::Value taken = std::move(entry);
         taken["feed"] = feed;
         auto it = index.find(name);
         if (it == index.end()) {
@@ -239,7 +265,7 @@ void PMSMergeFeedEntries(const std::unordered_set<std::string>& makerNames, cons
             out.append(std::move(taken));
             continue;
         }
-        PackageBasicInfo candidate(name, entry["version"].asString());
+        PackageBasicInfo candidate(name, version);
         PackageBasicInfo present(name, out[it->second]["version"].asString());
         if (candidate.compare(present, PKG_COMPOP_GT)) {
             out[it->second] = std::move(taken);
@@ -263,15 +289,15 @@ bool queryFeed(const char* language, const std::string& feed, Json::Value& data)
 }
 
 // The entries and keys of a feed's reply; false for a reply of another shape.
-bool feedEntries(const Json::Value& data, Json::Value& entries, Json::Value& keys) {
+bool feedEntries(Json::Value& data, Json::Value& entries, Json::Value& keys) {
     if (data.isArray()) {
-        entries = data;
+        entries = std::move(data);
         return true;
     }
     if (!isList(data)) {
         return false;
     }
-    entries = data["packages"];
+    entries = std::move(data["packages"]);
     if (data.isMember("keyrings") && data["keyrings"].isArray() && !data["keyrings"].empty()) {
         keys = data["keyrings"];
     }
@@ -349,7 +375,7 @@ bool CORVPackageServer::PMSQueryOtherPkgServer(bool force, const char* language,
             continue;
         }
         PMSUpdatePkgServerKey(feed, keys);
-        PMSMergeFeedEntries(makerNames, feed, entries, out, index);
+        PMSMergeFeedEntries(makerNames, feed, std::move(entries), out, index);
     }
     if (!cache.empty() && !toFile(out, cache)) {
         CORV_LOG_ERR("Fail to save %s, %m", cache.c_str());

@@ -18,16 +18,16 @@ void PMSSetLastStoreFailure(const std::string& words);
 // `st` receives its stat when not null.
 bool PMSIsCacheFresh(const std::string& path, struct stat* st);
 
-// `array` ordered so that each entry comes after the entries it depends on. False (and
-// `sorted` untouched) when an entry is not an object or the dependencies form a cycle.
-bool PMSSortPackageArray(const Json::Value& array, Json::Value& sorted);
+// Orders `array` in place so that each entry comes after the entries it depends on. False
+// (and `array` untouched) when an entry is not an object or the dependencies form a cycle.
+bool PMSSortPackageArray(Json::Value& array);
 
 // Merges one feed's entries into the feeds' array `out`: entries without text "package"
 // and "version" and names in `makerNames` are left out; a name already in `out` (found
 // through `index`, name to position) is replaced only by a greater version. Each entry
 // taken gets "feed": `feed`.
 void PMSMergeFeedEntries(const std::unordered_set<std::string>& makerNames, const std::string& feed,
-                         const Json::Value& entries, Json::Value& out,
+                         Json::Value entries, Json::Value& out,
                          std::unordered_map<std::string, Json::ArrayIndex>& index);
 
 // Parses a store reply; a reply that is not JSON is logged with the parser's messages and

@@ -149,7 +149,8 @@ TEST(StoreFeedsFile, BadUrlsAndDuplicatesAreRefused) {
     EXPECT_TRUE(out.isArray() && out.empty());
 }
 
-// A test CA and a server certificate for 127.0.0.1 signed by it, made with openssl(1).
+// A test CA and, for 127.0.0.1 and signed by it, a server certificate (server.crt) and
+// one that expired in 2020 (expired.crt, the same key), made with openssl(1).
 void makeCertificates(const std::string& dir) {
     const std::string script =
         "set -e; cd " + dir +
@@ -159,12 +160,27 @@ void makeCertificates(const std::string& dir) {
         " -subj '/CN=127.0.0.1' 2>/dev/null"
         "; printf 'subjectAltName=IP:127.0.0.1\\n' > ext"
         "; openssl x509 -req -in server.csr -CA ca.crt -CAkey ca.key -CAcreateserial"
-        " -out server.crt -days 2 -extfile ext 2>/dev/null";
+        " -out server.crt -days 2 -extfile ext 2>/dev/null"
+        // x509 -req only dates from now on; the ca command takes any dates.
+        "; printf '[ca]\\ndefault_ca=test\\n[test]\\ndatabase=index.txt\\nnew_certs_dir=.\\n"
+        "serial=serial\\ndefault_md=sha256\\npolicy=any\\n[any]\\ncommonName=supplied\\n' > ca.cnf"
+        "; : > index.txt; echo 01 > serial"
+        "; openssl ca -batch -notext -config ca.cnf -cert ca.crt -keyfile ca.key -in server.csr"
+        " -out expired.crt -startdate 20200101000000Z -enddate 20200102000000Z -extfile ext"
+        " 2>/dev/null";
     testutil::RunResult made = testutil::run("/bin/sh", {"-c", script});
     ASSERT_EQ(made.status, 0) << made.err;
 }
 
-TEST(StoreHttps, AnUntrustedCertificateIsRefusedAndNothingCachedUntilTheCaIsTrusted) {
+void trustCa(const std::string& dir) {
+    testutil::writeFile("/usr/local/share/ca-certificates/corv-test-ca.crt",
+                        testutil::readFile(dir + "/ca.crt"));
+    testutil::RunResult trust = testutil::run("/usr/sbin/update-ca-certificates", {});
+    ASSERT_EQ(trust.status, 0) << trust.err;
+}
+
+// One test for both refusals: trusting the test CA (update-ca-certificates) takes seconds.
+TEST(StoreHttps, AnUntrustedOrAnExpiredCertificateIsRefusedAndNothingCached) {
     const std::string dir = "/tmp/store-tls";
     CORVFSMkdirP(dir.c_str(), nullptr, 1, -1, -1, 0755);
     makeCertificates(dir);
@@ -175,20 +191,30 @@ TEST(StoreHttps, AnUntrustedCertificateIsRefusedAndNothingCachedUntilTheCaIsTrus
     testutil::setDefaultsKey("package_server", server.base());
     std::string cacheDir;
     ASSERT_TRUE(PMSGetListTmpDir(cacheDir));
+    const std::string cache = cacheDir + "corvserver.enu";
 
     Json::Value out;
     EXPECT_FALSE(CORVPackageServer::PMSQueryCorvPkgServer(true, "enu", out));
     EXPECT_NE(PMSGetLastStoreFailure().find("certificate is not trusted"), std::string::npos)
         << PMSGetLastStoreFailure();
-    EXPECT_FALSE(testutil::exists(cacheDir + "corvserver.enu"));
+    EXPECT_FALSE(testutil::exists(cache));
 
-    testutil::writeFile("/usr/local/share/ca-certificates/corv-test-ca.crt",
-                        testutil::readFile(dir + "/ca.crt"));
-    testutil::RunResult trust = testutil::run("/usr/sbin/update-ca-certificates", {});
-    ASSERT_EQ(trust.status, 0) << trust.err;
+    trustCa(dir);
     ASSERT_TRUE(CORVPackageServer::PMSQueryCorvPkgServer(true, "enu", out)) << out;
     EXPECT_EQ(out["packages"][0]["link"].asString(), server.base() + "/secure-1.0.cpk");
-    EXPECT_TRUE(testutil::exists(cacheDir + "corvserver.enu"));
+    const std::string good = testutil::readFile(cache);
+    ASSERT_NE(good.find("secure-1.0"), std::string::npos) << good;
+
+    // Signed by the CA now trusted, for the right address, but out of date.
+    StoreServer expired("/tmp/store-expired", {"--tls", dir + "/expired.crt", dir + "/server.key"});
+    ASSERT_TRUE(expired.running());
+    expired.setPackages(entries({{"secure", "2.0"}}));
+    testutil::setDefaultsKey("package_server", expired.base());
+    EXPECT_FALSE(CORVPackageServer::PMSQueryCorvPkgServer(true, "enu", out));
+    EXPECT_NE(PMSGetLastStoreFailure().find("certificate is not trusted"), std::string::npos)
+        << PMSGetLastStoreFailure();
+    EXPECT_EQ(testutil::readFile(cache), good);
+    EXPECT_TRUE(expired.requests().empty()) << "no request gets through the handshake";
 }
 
 // ---------------------------------------------------------------------------------------

@@ -2,7 +2,10 @@
 #include <stdio.h>
 #include <string.h>
 
+#include <iostream>
+#include <memory>
 #include <string>
+#include <utility>
 
 #include "cli.h"
 #include "corv/vlibc.h"
@@ -41,6 +44,18 @@ std::string storeFailure(const char* what, const Json::Value& message) {
     return words;
 }
 
+// A store's list is megabytes of JSON: it is written out as it is formatted instead of
+// being built into one string first.
+void printLarge(const Json::Value& value) {
+    Json::StreamWriterBuilder builder;
+    builder["indentation"] = "";
+    builder["emitUTF8"] = true;
+    std::unique_ptr<Json::StreamWriter> writer(builder.newStreamWriter());
+    fflush(stdout);
+    writer->write(value, &std::cout);
+    std::cout << '\n' << std::flush;
+}
+
 int storeList(const Command& self, const std::vector<std::string>& args) {
     CommonOptions opts;
     if (!parseCommon(args, self, opts, {{"--refresh", false}})) {
@@ -59,9 +74,9 @@ int storeList(const Command& self, const std::vector<std::string>& args) {
     }
     if (opts.json) {
         Json::Value out(Json::objectValue);
-        out["packages"] = list;
+        out["packages"] = std::move(list);
         out["errors"] = errors;
-        printf("%s\n", toString(out).c_str());
+        printLarge(out);
         return EXIT_OK;
     }
     printf("%-24s %-16s %-28s %s\n", "NAME", "VERSION", "DISPLAY NAME", "SOURCE");

@@ -11,6 +11,7 @@ port=8490
 
 # A package of 2,000 files and 50 MiB of random bytes (they do not compress, as real
 # binaries barely do), from the skeleton of "corvpkg new".
+mkdir -p "${src%/*}"
 "$corvpkg" new bigpkg "$src" >/dev/null
 for i in $(seq 0 1999); do
     mkdir -p "$src/package/d$((i % 50))"

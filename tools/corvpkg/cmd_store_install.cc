@@ -71,6 +71,11 @@ bool isNewer(const PackageInfo& entry, const std::string& installed) {
 // package only a feed offers, that entry alone.
 bool storeOrder(const std::string& name, const std::string& language,
                 std::vector<PackageInfo>& order, std::string& error) {
+    // What the stores offer now, not what the hour's cache remembers: a package just
+    // published must be found.
+    Json::Value fresh;
+    CORVPackageServer::PMSQueryCorvPkgServer(true, language.c_str(), fresh);
+    CORVPackageServer::PMSQueryOtherPkgServer(true, language.c_str(), fresh);
     PackageManager pm;
     std::vector<PackageInfo> pkgs;
     if (pm.getAncestryDepOrderByServer(name.c_str(), language.c_str(), pkgs)) {
@@ -180,8 +185,9 @@ int installFromStore(const CommonOptions& opts, const std::string& name, const c
             return printFailure(opts.json, PKG_ERR_SERVER, error);
         }
     }
+    // One package alone meets the file install's own check of its questions.
     std::string asking;
-    if (!wizardsAnswered(opts, name, files, plan, asking)) {
+    if (files.size() > 1 && !wizardsAnswered(opts, name, files, plan, asking)) {
         fprintf(stderr, "%s asks questions before it installs (corvpkg wizard <file> shows them)\n",
                 asking.c_str());
         return usageError(findCommand(command),

@@ -354,3 +354,69 @@ TEST_F(StoreTask, StoreIconsMustBeSmallImages) {
 }
 
 }  // namespace
+
+namespace {
+
+// The update check's rules over installed fixtures and a hand-written catalogue: nothing
+// is downloaded, since no entry allows a silent upgrade.
+class UpdateCheck : public ::testing::Test {
+  protected:
+    void SetUp() override {
+        ASSERT_TRUE(server_.running());
+        testutil::setDefaultsKey("package_server", server_.base() + "/");
+        for (const char* name : {"alpha", "beta", "gamma"}) {
+            testutil::installFixture(testutil::TestPackage(name, "1.0-0001"));
+        }
+        Json::Value entries(Json::arrayValue);
+        entries.append(testutil::storeEntry("alpha", "2.0-0001"));
+        Json::Value beta = testutil::storeEntry("beta", "2.0-0001");
+        beta["beta"] = true;
+        entries.append(beta);
+        Json::Value gamma = testutil::storeEntry("gamma", "2.0-0001");
+        gamma["auto_upgrade_from"] = "1.5";
+        entries.append(gamma);
+        server_.setPackages(entries);
+        unlink(kNotes);
+    }
+    std::vector<std::string> reported(bool scheduled) {
+        std::vector<PackageInfo> found;
+        EXPECT_TRUE(PMSCheckUpgrade(scheduled, nullptr, "enu", &found));
+        std::vector<std::string> names;
+        for (const PackageInfo& info : found) {
+            names.push_back(info.package);
+        }
+        return names;
+    }
+    StoreServer server_{kStoreDir};
+};
+
+TEST_F(UpdateCheck, BetaAndUnreachableReleasesAreReportedOnlyWithoutAutomaticUpdate) {
+    VLIBCFileSetKeyValue(VLIBC_INFO_PATH, "upgrade_pkg_nos_notification", "yes", nullptr);
+    // Unscheduled: everything newer is reported, nobody is told, the badge counts it.
+    EXPECT_EQ(reported(false), (std::vector<std::string>{"alpha", "beta", "gamma"}));
+    EXPECT_FALSE(testutil::exists(kNotes));
+    EXPECT_EQ(testutil::readFile(kBadge), "3\n");
+
+    // Automatic update on for chosen packages: the beta over a stable installation and the
+    // release that can't be reached from 1.0 are neither upgraded nor reported; alpha,
+    // chosen but not silent, is dropped from the choice with one notification.
+    ASSERT_TRUE(CORVPackageServer::Save(true, false, StoreServer::rulesFromText(R"(["alpha"])")));
+    EXPECT_EQ(reported(true), (std::vector<std::string>{"alpha"}));
+    Json::Value chosen;
+    ASSERT_TRUE(CORVPackageServer::List(chosen));
+    EXPECT_TRUE(chosen.empty()) << chosen;
+    const std::string notes = testutil::readFile(kNotes);
+    EXPECT_NE(notes.find("pkgmgr:auto_update_non_support"), std::string::npos) << notes;
+    EXPECT_NE(notes.find("pkgmgr:upgrade_one_package\talpha (display)"), std::string::npos)
+        << notes;
+
+    // Two to report: the notification carries the count.
+    ASSERT_TRUE(CORVPackageServer::Save(false, false, Json::Value()));
+    unlink(kNotes);
+    VLIBCFileSetKeyValue(VLIBC_INFO_PATH, "enable_pkg_autoupdate_all", "no", nullptr);
+    EXPECT_EQ(reported(true).size(), 3u);
+    EXPECT_NE(testutil::readFile(kNotes).find("pkgmgr:upgrade_packages\t3"), std::string::npos)
+        << testutil::readFile(kNotes);
+}
+
+}  // namespace

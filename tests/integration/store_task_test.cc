@@ -346,6 +346,20 @@ TEST_F(StoreTask, StoreIconsMustBeSmallImages) {
         EXPECT_NE(out[0], '\0');
         EXPECT_EQ(testutil::exists(out), c.ok) << "a refused image is removed";
     }
+    // An installed package's icon comes from its INFO, decoded, and through the cache.
+    testutil::TestPackage pkg("painted", "1.0-0001");
+    pkg.info["package_icon"] = "iVBORw0KGgpwcHBwcHBwcHBwcHA=";  // the PNG magic and 12 "p"
+    testutil::installFixture(pkg);
+    std::string bytes;
+    ASSERT_TRUE(PMSGetInstallImageByName(PKG_INFO_PACKAGE_ICON, "painted", bytes));
+    EXPECT_EQ(bytes, "\x89PNG\r\n\x1a\n" + std::string(12, 'p'));
+    EXPECT_FALSE(PMSGetInstallImageByName(PKG_INFO_PACKAGE_ICON_256, "painted", bytes));
+    EXPECT_FALSE(PMSGetInstallImageByName(static_cast<PKG_INFO_TYPE>(0x18), "painted", bytes));
+    char cached[4096] = {0};
+    ASSERT_TRUE(PMSGetInstallImage(PKG_INFO_PACKAGE_ICON, "installed", "painted", "1.0-0001",
+                                   "icon.png", cached, sizeof cached));
+    EXPECT_EQ(testutil::readFile(cached), bytes);
+
     // The cached image is served without asking the store again.
     const size_t asked = server_.requests().size();
     EXPECT_TRUE(PMSGetServerImage("store", "hello", "1.0", "good.png", link("good.png").c_str(),

@@ -10,6 +10,7 @@
 #include <memory>
 #include <sstream>
 #include <thread>
+#include <vector>
 
 #include <httplib.h>
 
@@ -29,6 +30,7 @@ struct Reply {
     int status = 200;
     std::string body;
     std::string contentType = kJson;
+    std::string file;  // a file served as it stands, read as it is sent
 };
 
 Reply jsonReply(const Json::Value& value, int status = 200) {
@@ -90,6 +92,29 @@ bool providePiece(const std::string& body, const Fault& fault, size_t offset, si
     return sink.write(body.data() + offset, count);
 }
 
+// A package file of tens of megabytes goes out in large reads, never whole in memory.
+void streamFile(const std::string& path, const std::string& type, httplib::Response& res) {
+    struct stat st {};
+    auto file = std::shared_ptr<FILE>(fopen(path.c_str(), "rb"), [](FILE* f) {
+        if (f != nullptr) {
+            fclose(f);
+        }
+    });
+    if (!file || fstat(fileno(file.get()), &st) != 0) {
+        res.status = 404;
+        res.set_content("not found\n", "text/plain");
+        return;
+    }
+    res.set_content_provider(
+        static_cast<size_t>(st.st_size), type,
+        [file](size_t offset, size_t length, httplib::DataSink& sink) {
+            std::vector<char> block(std::min<size_t>(length, 1 << 20));
+            const ssize_t got =
+                pread(fileno(file.get()), block.data(), block.size(), static_cast<off_t>(offset));
+            return got > 0 && sink.write(block.data(), static_cast<size_t>(got));
+        });
+}
+
 void deliver(const Fault& fault, Reply reply, httplib::Response& res) {
     if (fault.delayMs > 0) {
         std::this_thread::sleep_for(std::chrono::milliseconds(fault.delayMs));
@@ -99,8 +124,16 @@ void deliver(const Fault& fault, Reply reply, httplib::Response& res) {
         return;
     }
     res.status = fault.status != 0 ? fault.status : reply.status;
-    auto body = std::make_shared<std::string>(fault.replaceBody ? fault.body : reply.body);
     const std::string type = fault.contentType.empty() ? reply.contentType : fault.contentType;
+    const bool cutShort = fault.chunked || fault.stallAfter >= 0 || fault.cutAfter >= 0;
+    if (!reply.file.empty() && !fault.replaceBody && !cutShort) {
+        streamFile(reply.file, type, res);
+        return;
+    }
+    if (!reply.file.empty() && !fault.replaceBody) {
+        readWholeFile(reply.file, reply.body);
+    }
+    auto body = std::make_shared<std::string>(fault.replaceBody ? fault.body : reply.body);
     if (fault.chunked) {
         res.set_chunked_content_provider(
             type, [body, fault](size_t offset, httplib::DataSink& sink) {
@@ -266,14 +299,17 @@ class Store {
 
     Reply routeFile(const std::string& path) {
         Reply reply;
-        if (path.find("..") != std::string::npos || path == "/" ||
-            !readWholeFile(options_.dir + path, reply.body)) {
+        struct stat st {};
+        const std::string full = options_.dir + path;
+        if (path.find("..") != std::string::npos || path == "/" || stat(full.c_str(), &st) != 0 ||
+            !S_ISREG(st.st_mode)) {
             reply.status = 404;
             reply.body = "not found\n";
             reply.contentType = "text/plain";
             return reply;
         }
         reply.contentType = contentTypeOf(path);
+        reply.file = full;
         return reply;
     }
 

@@ -4,6 +4,7 @@ no package, names that are no package names; and an upload installed end to end.
 import os
 import sys
 import unittest
+import urllib.parse
 
 from center_client import Client
 
@@ -85,9 +86,10 @@ class Uploads(unittest.TestCase):
         self.assertFalse(os.path.exists("/etc/evil.cpk"))
 
     def test_names_that_are_no_package_names_reach_nothing(self):
-        for name in ["hello;touch /tmp/pwned", "..%2f..%2fetc", "$(touch /tmp/pwned)"]:
+        for name in ["hello;touch /tmp/pwned", "../../etc", "$(touch /tmp/pwned)"]:
             with self.subTest(name=name):
-                status, _ = self.client.call("POST", "/api/packages/" + name + "/start", {})
+                status, _ = self.client.call(
+                    "POST", "/api/packages/" + urllib.parse.quote(name, safe="") + "/start", {})
                 self.assertEqual(status, 404)
         status, body = self.client.call("POST", "/api/store/install",
                                         {"packages": ["hello; touch /tmp/pwned"]})

@@ -48,4 +48,4 @@ done
 export CENTER_URL=http://127.0.0.1:8490 CENTER_ARTEFACTS=$artefacts CORV_STORE=$store
 export CENTER_FEED_DIR=$out/published CENTER_UPGRADE=$out/greeter-1.1.0-0001.cpk
 export CENTER_HELLO=$out/published/hello-1.0.0-0001.cpk
-python3 "$here/${which}_test.py"
+/usr/bin/python3 "$here/${which}_test.py"

@@ -10,6 +10,8 @@ import time
 import unittest
 
 from selenium import webdriver
+from selenium.common.exceptions import NoSuchElementException, StaleElementReferenceException
+from selenium.webdriver.chrome.service import Service
 from selenium.webdriver.common.by import By
 from selenium.webdriver.support import expected_conditions as ready
 from selenium.webdriver.support.ui import WebDriverWait
@@ -24,7 +26,7 @@ def chromium():
     for flag in ["--headless=new", "--no-sandbox", "--disable-dev-shm-usage", "--disable-gpu",
                  "--window-size=1200,900", "--no-first-run", "--disable-extensions"]:
         options.add_argument(flag)
-    service = webdriver.ChromeService(executable_path="/usr/bin/chromedriver")
+    service = Service(executable_path="/usr/bin/chromedriver")
     return webdriver.Chrome(service=service, options=options)
 
 
@@ -32,7 +34,8 @@ class PackageCenterInBrowser(unittest.TestCase):
     @classmethod
     def setUpClass(cls):
         cls.browser = chromium()
-        cls.wait = WebDriverWait(cls.browser, 60, poll_frequency=0.1)
+        cls.wait = WebDriverWait(cls.browser, 30, poll_frequency=0.1,
+                                 ignored_exceptions=[StaleElementReferenceException])
 
     @classmethod
     def tearDownClass(cls):
@@ -45,7 +48,17 @@ class PackageCenterInBrowser(unittest.TestCase):
         return self.wait.until(ready.visibility_of_element_located((By.CSS_SELECTOR, selector)))
 
     def click(self, selector):
-        self.wait.until(ready.element_to_be_clickable((By.CSS_SELECTOR, selector))).click()
+        """Clicks, again when the page redrew the element between finding and clicking."""
+        def clicked(browser):
+            try:
+                element = browser.find_element(By.CSS_SELECTOR, selector)
+                if not (element.is_displayed() and element.is_enabled()):
+                    return False
+                element.click()
+                return True
+            except (NoSuchElementException, StaleElementReferenceException):
+                return False
+        self.wait.until(clicked)
 
     def text_in(self, selector, text):
         self.wait.until(ready.text_to_be_present_in_element((By.CSS_SELECTOR, selector), text))
@@ -110,7 +123,7 @@ class PackageCenterInBrowser(unittest.TestCase):
         self.shot("uninstall-confirm")
         self.click("#confirm-ok")
         self.wait_tasks_over()
-        self.text_in("#message", "greeter")
+        self.text_in("#message", "needed by: Greeter")
         self.shot("uninstall-refused")
 
         # greeter 1.1 is published: the updates list offers it.

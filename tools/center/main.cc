@@ -60,8 +60,8 @@ int main(int argc, char** argv) {
     center::CenterOptions options;
     // Installed, the page lies in the data directory; run from the build tree, in the
     // sources.
-    options.www = access(CORV_CENTER_WWW "/index.html", R_OK) == 0 ? CORV_CENTER_WWW
-                                                                   : CORV_CENTER_SOURCE_WWW;
+    options.www =
+        access(CORV_CENTER_WWW "/index.html", R_OK) == 0 ? CORV_CENTER_WWW : CORV_CENTER_SOURCE_WWW;
     options.program = selfPath();
     for (size_t i = 0; i < args.size(); ++i) {
         const std::string& arg = args[i];

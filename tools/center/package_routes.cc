@@ -60,16 +60,15 @@ void addPackageRoutes(httplib::Server& server, Center& center) {
                });
     server.Post(std::string("/api/packages/") + kNamePattern + "/(start|stop|uninstall)",
                 [&center](const httplib::Request& request, httplib::Response& response) {
-                    startControl(center, request, response, request.matches[1],
-                                 request.matches[2]);
+                    startControl(center, request, response, request.matches[1], request.matches[2]);
                 });
     server.Get("/api/store", [](const httplib::Request& request, httplib::Response& response) {
         std::lock_guard<std::mutex> hold(queryLock());
         sendJson(response, storePackages(request.get_param_value("refresh") == "1"));
     });
-    server.Get("/api/updates", [](const httplib::Request&, httplib::Response& response) {
+    server.Get("/api/updates", [](const httplib::Request& request, httplib::Response& response) {
         std::lock_guard<std::mutex> hold(queryLock());
-        sendJson(response, availableUpdates());
+        sendJson(response, availableUpdates(request.get_param_value("refresh") == "1"));
     });
 }
 

@@ -47,8 +47,8 @@ std::map<std::string, std::string> installedVersions() {
 }
 
 bool isNewer(const std::string& name, const std::string& candidate, const std::string& current) {
-    return PackageBasicInfo(name, candidate).compare(PackageBasicInfo(name, current),
-                                                     PKG_COMPOP_GT);
+    return PackageBasicInfo(name, candidate)
+        .compare(PackageBasicInfo(name, current), PKG_COMPOP_GT);
 }
 
 }  // namespace
@@ -60,8 +60,8 @@ std::mutex& queryLock() {
 
 Json::Value installedPackages() {
     PackageManager pm;
-    std::vector<std::string> names = pm.enumPackages(static_cast<const char*>(nullptr),
-                                                     PKG_INFO_MASK_ALL);
+    std::vector<std::string> names =
+        pm.enumPackages(static_cast<const char*>(nullptr), PKG_INFO_MASK_ALL);
     std::sort(names.begin(), names.end());
     Json::Value rows(Json::arrayValue);
     for (const std::string& name : names) {
@@ -128,8 +128,8 @@ Json::Value storePackages(bool refresh) {
     return out;
 }
 
-Json::Value availableUpdates() {
-    Json::Value store = storePackages(false);
+Json::Value availableUpdates(bool refresh) {
+    Json::Value store = storePackages(refresh);
     Json::Value out(Json::arrayValue);
     for (const Json::Value& entry : store["packages"]) {
         if (entry["action"].asString() == "upgrade") {
@@ -147,8 +147,7 @@ bool storePlan(const Json::Value& names, Json::Value& plan, std::string& why) {
     }
     std::set<std::string> placed, visiting;
     plan = Json::Value(Json::arrayValue);
-    std::function<bool(const std::string&, bool)> place = [&](const std::string& name,
-                                                              bool asked) {
+    std::function<bool(const std::string&, bool)> place = [&](const std::string& name, bool asked) {
         if (placed.count(name) != 0 || (!asked && PMSCheckPackage(name))) {
             return true;
         }

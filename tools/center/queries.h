@@ -25,8 +25,8 @@ Json::Value packageDetails(const std::string& name);
 // "upgrade" | "installed"], "errors": [...]} from the maker store and the feeds.
 Json::Value storePackages(bool refresh);
 
-// The store entries newer than what is installed.
-Json::Value availableUpdates();
+// The store entries newer than what is installed; `refresh` asks the stores again.
+Json::Value availableUpdates(bool refresh);
 
 // The store entries to download for `names`: each named entry, after the entries of the
 // packages it depends on that are not installed, in install order. False with `why` when

@@ -15,8 +15,8 @@ Json::Value describeResult(int code) {
         return out;
     }
     out["name"] = info->name;
-    out["key"] = info->installMsg ? info->installMsg
-                                  : (info->checkReport ? info->checkReport : info->name);
+    out["key"] =
+        info->installMsg ? info->installMsg : (info->checkReport ? info->checkReport : info->name);
     out["meaning"] = info->meaning;
     return out;
 }

@@ -31,8 +31,8 @@ std::string cookieValue(const httplib::Request& request, const std::string& name
     size_t at = 0;
     while (at < header.size()) {
         size_t end = header.find(';', at);
-        std::string part = header.substr(at, end == std::string::npos ? std::string::npos
-                                                                       : end - at);
+        std::string part =
+            header.substr(at, end == std::string::npos ? std::string::npos : end - at);
         part.erase(0, part.find_first_not_of(' '));
         if (part.compare(0, name.size() + 1, name + "=") == 0) {
             return part.substr(name.size() + 1);
@@ -101,47 +101,47 @@ void addPageRoutes(httplib::Server& server, Center& center) {
 }
 
 void addSessionRoutes(httplib::Server& server, Center& center) {
-    server.Post("/api/login", [&center](const httplib::Request& request,
-                                        httplib::Response& response) {
-        Json::Value body;
-        if (!jsonBody(request, response, body)) {
-            return;
-        }
-        const std::string user = body["user"].asString();
-        if (!pamAuthenticate(center.options.pamService, user, body["password"].asString())) {
-            sendError(response, 401, "credentials", "wrong user name or password");
-            return;
-        }
-        if (!isAdministrator(user)) {
-            sendError(response, 403, "not_admin",
-                      user + " is not in the group administrators, who manage packages");
-            return;
-        }
-        const std::string id = center.sessions.open(user);
-        Session session;
-        if (id.empty() || !center.sessions.find(id, session)) {
-            sendError(response, 500, "session", "no session could be made");
-            return;
-        }
-        response.set_header("Set-Cookie", std::string(kCookie) + "=" + id +
-                                              "; Path=/; HttpOnly; SameSite=Strict");
-        Json::Value out(Json::objectValue);
-        out["user"] = user;
-        out["csrf"] = session.csrf;
-        sendJson(response, out);
-    });
+    server.Post(
+        "/api/login", [&center](const httplib::Request& request, httplib::Response& response) {
+            Json::Value body;
+            if (!jsonBody(request, response, body)) {
+                return;
+            }
+            const std::string user = body["user"].asString();
+            if (!pamAuthenticate(center.options.pamService, user, body["password"].asString())) {
+                sendError(response, 401, "credentials", "wrong user name or password");
+                return;
+            }
+            if (!isAdministrator(user)) {
+                sendError(response, 403, "not_admin",
+                          user + " is not in the group administrators, who manage packages");
+                return;
+            }
+            const std::string id = center.sessions.open(user);
+            Session session;
+            if (id.empty() || !center.sessions.find(id, session)) {
+                sendError(response, 500, "session", "no session could be made");
+                return;
+            }
+            response.set_header("Set-Cookie", std::string(kCookie) + "=" + id +
+                                                  "; Path=/; HttpOnly; SameSite=Strict");
+            Json::Value out(Json::objectValue);
+            out["user"] = user;
+            out["csrf"] = session.csrf;
+            sendJson(response, out);
+        });
     server.Get("/api/session", [](const httplib::Request& request, httplib::Response& response) {
         Json::Value out(Json::objectValue);
         out["user"] = request.get_header_value("X-Center-User");
         out["csrf"] = request.get_header_value("X-Center-Csrf");
         sendJson(response, out);
     });
-    server.Post("/api/logout", [&center](const httplib::Request& request,
-                                         httplib::Response& response) {
-        center.sessions.close(cookieValue(request, kCookie));
-        response.set_header("Set-Cookie", std::string(kCookie) + "=; Path=/; Max-Age=0");
-        sendJson(response, Json::Value(Json::objectValue));
-    });
+    server.Post(
+        "/api/logout", [&center](const httplib::Request& request, httplib::Response& response) {
+            center.sessions.close(cookieValue(request, kCookie));
+            response.set_header("Set-Cookie", std::string(kCookie) + "=; Path=/; Max-Age=0");
+            sendJson(response, Json::Value(Json::objectValue));
+        });
 }
 
 bool splitListen(const std::string& listen, std::string& host, int& port) {
@@ -212,8 +212,8 @@ int serveCenter(const CenterOptions& options) {
     addSessionRoutes(server, center);
     addPackageRoutes(server, center);
     addTaskRoutes(server, center);
-    const int bound = port == 0 ? server.bind_to_any_port(host)
-                                : (server.bind_to_port(host, port) ? port : -1);
+    const int bound =
+        port == 0 ? server.bind_to_any_port(host) : (server.bind_to_port(host, port) ? port : -1);
     if (bound < 0) {
         fprintf(stderr, "corv-center: cannot listen on %s\n", options.listen.c_str());
         return 2;

@@ -12,7 +12,7 @@
 //   GET  /api/packages/<name>             one package with dependents and log
 //   POST /api/packages/<name>/<action>    start, stop, uninstall ({"answers"}): a task
 //   GET  /api/store[?refresh=1]           the stores' packages
-//   GET  /api/updates                     the store entries newer than what is installed
+//   GET  /api/updates[?refresh=1]         the store entries newer than what is installed
 //   POST /api/store/install {"packages"}  downloads them (and missing dependencies): a task
 //   POST /api/upload                      multipart field "file", a .cpk: a task, ready
 //   GET  /api/tasks, /api/tasks/<id>      state, progress, and the questions when ready
@@ -26,10 +26,10 @@ namespace center {
 
 struct CenterOptions {
     std::string listen = "127.0.0.1:8490";
-    std::string www;                     // the page's files
+    std::string www;                             // the page's files
     std::string state = "/var/tmp/corv-center";  // task directories
     std::string pamService = "corv-center";
-    std::string program;                 // this program, for its workers
+    std::string program;  // this program, for its workers
     unsigned long long maxUpload = 256ULL << 20;
     int sessionMinutes = 30;
 };

@@ -44,8 +44,7 @@ bool ownTask(Center& center, const httplib::Request& request, httplib::Response&
              std::string& id) {
     id = request.matches[1];
     Json::Value owner;
-    if (!center.tasks.exists(id) ||
-        !readJsonFile(center.tasks.dir(id) + "/owner.json", owner) ||
+    if (!center.tasks.exists(id) || !readJsonFile(center.tasks.dir(id) + "/owner.json", owner) ||
         owner["owner"].asString() != sessionOf(request).user) {
         sendError(response, 404, "no_task", "no such task");
         return false;
@@ -164,14 +163,14 @@ void addTaskRoutes(httplib::Server& server, Center& center) {
                 [&center](const httplib::Request& request, httplib::Response& response) {
                     storeInstall(center, request, response);
                 });
-    server.Post("/api/upload", [&center](const httplib::Request& request,
-                                         httplib::Response& response) {
-        upload(center, request, response);
-    });
-    server.Get("/api/tasks", [&center](const httplib::Request& request,
-                                       httplib::Response& response) {
-        sendJson(response, center.tasks.list(sessionOf(request).user));
-    });
+    server.Post("/api/upload",
+                [&center](const httplib::Request& request, httplib::Response& response) {
+                    upload(center, request, response);
+                });
+    server.Get("/api/tasks",
+               [&center](const httplib::Request& request, httplib::Response& response) {
+                   sendJson(response, center.tasks.list(sessionOf(request).user));
+               });
     server.Get("/api/tasks/([0-9a-f]{1,64})",
                [&center](const httplib::Request& request, httplib::Response& response) {
                    std::string id;

@@ -81,8 +81,8 @@ int download(const std::string& dir, const Json::Value& request, StateWriter& st
         const std::string file = dir + "/" + name + ".cpk";
         if (!PMSDownloadFile(entry["link"].asCString(), part.c_str(), nullptr, nullptr, nullptr)) {
             const std::string why = PMSGetLastStoreFailure();
-            state.value()["result"] = failure(
-                "the download of " + name + " failed" + (why.empty() ? "" : ": " + why));
+            state.value()["result"] =
+                failure("the download of " + name + " failed" + (why.empty() ? "" : ": " + why));
             state.set("failed");
             return 1;
         }
@@ -112,8 +112,7 @@ int download(const std::string& dir, const Json::Value& request, StateWriter& st
 Json::Value answersFor(const std::string& file, const Json::Value& given) {
     PackageManager pm;
     PackageInfo info;
-    pm.queryPackageFileInfoWithWizard(file, info, static_cast<PKG_INSTALLATION_TYPE>(0),
-                                      kLanguage);
+    pm.queryPackageFileInfoWithWizard(file, info, static_cast<PKG_INSTALLATION_TYPE>(0), kLanguage);
     Json::Value answers(Json::objectValue);
     getUIDefaultValues(info.wizard, answers);
     for (const std::string& key : answers.getMemberNames()) {
@@ -162,15 +161,16 @@ int control(const Json::Value& request, StateWriter& state) {
     int outcome = 0;
     if (action == "uninstall") {
         const Json::Value& answers = request["answers"];
-        outcome = pm.uninstall(name, answers.isObject() && !answers.empty() ? &answers : nullptr,
-                               kLanguage, static_cast<PKG_INSTALLATION_TYPE>(4), false,
-                               user.c_str());
+        outcome =
+            pm.uninstall(name, answers.isObject() && !answers.empty() ? &answers : nullptr,
+                         kLanguage, static_cast<PKG_INSTALLATION_TYPE>(4), false, user.c_str());
     } else {
         const bool start = action == "start";
         outcome = pm.serviceControl(static_cast<PKG_INSTALLATION_TYPE>(start ? 8 : 0x10), name,
                                     start, kLanguage, user.c_str(), nullptr, true, true);
     }
     state.value()["result"] = describeOutcome(pm);
+    state.value()["result"]["package"] = name;
     state.set(outcome == 1 ? "done" : "failed");
     return outcome == 1 ? 0 : 1;
 }

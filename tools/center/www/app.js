@@ -319,7 +319,10 @@ async function resumeTasks() {
 }
 
 function refresh() {
-  if (state.view === 'details' && state.details) openDetails(state.details.package).catch(report);
+  // A package that was just uninstalled has no details to show any more.
+  if (state.view === 'details' && state.details) {
+    openDetails(state.details.package).catch((error) => (error.status === 404 ? showView('installed') : report(error)));
+  }
   else showView(state.view);
 }
 

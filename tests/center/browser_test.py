@@ -123,7 +123,7 @@ class PackageCenterInBrowser(unittest.TestCase):
         self.shot("uninstall-confirm")
         self.click("#confirm-ok")
         self.wait_tasks_over()
-        self.text_in("#message", "needed by: Greeter")
+        self.text_in("#message", "depend on hello: Greeter")
         self.shot("uninstall-refused")
 
         # greeter 1.1 is published: the updates list offers it.

@@ -197,7 +197,7 @@ Json::Value stagedQuestions(const Json::Value& files) {
         one["package"] = entry["package"];
         if (!pm.queryPackageFileInfoWithWizard(file, info, static_cast<PKG_INSTALLATION_TYPE>(0),
                                                kLanguage)) {
-            one["error"] = describeOutcome(pm);
+            one["error"] = describeOutcome(pm, entry["package"].asString(), "check");
             out.append(one);
             continue;
         }

@@ -1,12 +1,17 @@
 #include "results.h"
 
+#include "message_text.h"
+
 namespace center {
 
 using namespace CORVPackageTool;
 
-Json::Value describeResult(int code) {
+Json::Value describeResult(int code, const std::map<std::string, std::string>& params) {
     Json::Value out(Json::objectValue);
     out["code"] = code;
+    const corvtext::Text words = corvtext::textForCode(code, params, corvtext::Audience::Desktop);
+    out["text"] = words.sentence;
+    out["remedy"] = words.remedy;
     const PKG_ERRCODE_INFO* info = PMSGetErrCodeInfo(code);
     if (info == nullptr) {
         out["name"] = "unknown";
@@ -21,13 +26,18 @@ Json::Value describeResult(int code) {
     return out;
 }
 
-Json::Value describeOutcome(PackageManager& pm) {
-    Json::Value out = describeResult(pm.getResult());
+Json::Value describeOutcome(PackageManager& pm, const std::string& package,
+                            const std::string& operation) {
+    std::map<std::string, std::string> params{{"package", package}, {"operation", operation}};
     for (const char* key : {"deppkg", "oldver", "curver", "services"}) {
         const std::string value = pm.getMapParam(key);
         if (!value.empty()) {
-            out[key] = value;
+            params[key] = value;
         }
+    }
+    Json::Value out = describeResult(pm.getResult(), params);
+    for (const auto& param : params) {
+        out[param.first] = param.second;
     }
     Json::Value workerMsg = pm.getJsonParam("worker_msg");
     if (!(workerMsg.isString() && workerMsg.asString().empty())) {

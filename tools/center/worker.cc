@@ -9,6 +9,7 @@
 
 #include "corvpkg/corvpkg.h"
 #include "corvpkg/pkgcurltool.h"
+#include "corvpkg/pkgvolume.h"
 #include "corvpkg/pkgwizard.h"
 #include "results.h"
 #include "tasks.h"
@@ -66,6 +67,7 @@ std::string fileMd5(const std::string& path) {
 Json::Value failure(const std::string& meaning, int code = PKG_ERR_SERVER) {
     Json::Value result = describeResult(code);
     result["meaning"] = meaning;
+    result["text"] = meaning;
     return result;
 }
 
@@ -138,8 +140,9 @@ int install(const Json::Value& request, StateWriter& state) {
         int outcome = pm.install(user.c_str(), file, "", true, answers.empty() ? nullptr : &answers,
                                  kLanguage, false, verify);
         if (outcome != 1) {
-            state.value()["result"] = describeOutcome(pm);
-            state.value()["result"]["package"] = entry["package"];
+            state.value()["result"] = describeOutcome(
+                pm, entry["package"].asString(),
+                PMSCheckPackage(entry["package"].asString()) ? "upgrade" : "install");
             state.set("failed");
             return 1;
         }
@@ -169,8 +172,7 @@ int control(const Json::Value& request, StateWriter& state) {
         outcome = pm.serviceControl(static_cast<PKG_INSTALLATION_TYPE>(start ? 8 : 0x10), name,
                                     start, kLanguage, user.c_str(), nullptr, true, true);
     }
-    state.value()["result"] = describeOutcome(pm);
-    state.value()["result"]["package"] = name;
+    state.value()["result"] = describeOutcome(pm, name, action);
     state.set(outcome == 1 ? "done" : "failed");
     return outcome == 1 ? 0 : 1;
 }

@@ -42,11 +42,12 @@ async function api(method, path, body) {
 // A result of the engine in words: its sentence, its message key, and what it names.
 function resultText(result) {
   if (!result) return 'failed';
-  let text = result.meaning || result.name || 'failed';
+  let text = result.text || result.meaning || result.name || 'failed';
+  if (result.remedy) text += ' ' + result.remedy;
   if (result.key) text += ' (' + result.key + ')';
-  if (result.package) text = result.package + ': ' + text;
-  if (result.deppkg) text += '\nneeded by: ' + result.deppkg;
-  if (result.services) text += '\nservices: ' + result.services;
+  if (result.package && !text.includes(result.package)) text = result.package + ': ' + text;
+  if (result.deppkg && !text.includes(result.deppkg)) text += '\nneeded by: ' + result.deppkg;
+  if (result.services && !text.includes(result.services)) text += '\nservices: ' + result.services;
   if (result.oldver || result.curver) text += '\nversions: ' + result.oldver + ' / ' + result.curver;
   if (result.worker_msg) text += '\n' + (typeof result.worker_msg === 'string' ? result.worker_msg : JSON.stringify(result.worker_msg));
   return text;

@@ -27,11 +27,13 @@ for name in hello greeter notes; do
 done
 
 # The upgrade differs from the source only in its version, which its daemon shows in
-# every answer and its scripts write into their record.
+# every answer and its scripts write into their record, and in silent_upgrade, which lets
+# the scheduled update check install it without asking.
 stage=$(mktemp -d)
 trap 'rm -rf "$stage"' EXIT
 for name in greeter notes; do
     cp -a "$here/$name" "$stage/$name"
     sed "s/^version=.*/version=\"$upgrade_version\"/" "$here/$name/INFO" >"$stage/$name/INFO"
+    echo 'silent_upgrade="yes"' >>"$stage/$name/INFO"
     "$corvpkg" build "$stage/$name" -o "$out/$name-$upgrade_version.cpk"
 done

@@ -215,6 +215,35 @@ ask "The portal is gone" 5000 "" /notes/
 check "Its database was dropped with it" "$db_count" "0"
 check "And its role" "psql -X -U postgres -tAc \"SELECT count(*) FROM pg_roles WHERE rolname = 'notes'\"" "0"
 
+# From the store to a running package: greeter named from the maker store, hello with it;
+# then an update published, listed, and installed by the scheduled update check.
+show "Publish hello and greeter 1.0.0 in the maker store, drop the feed (it has greeter 1.1.0
+already), and trust any publisher: the example files are not signed" \
+    "cp $out/hello-1.0.0-0001.cpk $out/greeter-1.0.0-0001.cpk /tmp/maker-store/ &&
+     '$store' index /tmp/maker-store && '$corvpkg' feed remove http://127.0.0.1:8481/feed &&
+     sed -i '/^pkg_source_trust_level=/d' /etc/corvinfo.conf &&
+     printf 'pkg_source_trust_level=\"2\"\n' >>/etc/corvinfo.conf"
+step "Install greeter by name: the store's order downloads and installs hello first" 0 \
+    install greeter --answers /tmp/answers.json
+ask "greeter from the store answers, with hello" 9123 "Hello from the demo"
+step "No download or install task is left" 0 tasks
+show "Publish greeter 1.1.0 in the maker store" \
+    "cp $out/greeter-1.1.0-0001.cpk /tmp/maker-store/ && '$store' index /tmp/maker-store"
+offers "What can be upgraded (and why not the rest)" "1.1.0-0001" updates --refresh
+step "Choose greeter for automatic update: the scheduler's job autopkgupgrade follows" 0 \
+    autoupdate set greeter
+show "The job as the scheduler keeps it" "cat /etc/cron.d/corvcrond_sys_autopkgupgrade"
+show "Run the job's command as cron would: the scheduled update check" \
+    "grep -o '/usr/corv/bin/corvpkg chkupgradepkg.*' /etc/cron.d/corvcrond_sys_autopkgupgrade | sh"
+ask "greeter 1.1.0 answers, upgraded by the check" 9123 "greeter 1.1.0-0001"
+check "The notification the upgrade sent to the desktop" \
+    "grep -o 'pkgmgr:upgrade_[a-z_]*completed.Greeter' /var/log/corvnosnotify.log | tr '\t' ' '" \
+    "pkgmgr:upgrade_start_pkg_completed Greeter"
+check "The desktop's badge: nothing left to update" \
+    "cat /var/cache/corv/badge/CORV.NDS.PkgManApp.Instance" "0"
+step "Uninstall greeter" 0 uninstall greeter
+step "Uninstall hello" 0 uninstall hello
+
 show "What greeter's scripts recorded (the record outlives the package)" \
     "cut -d' ' -f3- /usr/corv/etc/packages/greeter/scripts.log"
 show "The system event log" "cut -f2- /var/log/corvevents.log"

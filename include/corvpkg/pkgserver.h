@@ -40,12 +40,19 @@
 
 struct VLIBSZHASH;
 
+namespace NOS {
+class Task;
+}
+
 namespace CORVPackageTool {
 
 #define PKG_FEEDS_FILE "/usr/corv/etc/packages/feeds"
 #define PKG_AUTO_UPDATE_FILE "/usr/corv/etc/packages/<auto_update_pkgs>"
 #define PKG_MAKER_CACHE_PREFIX "corvserver."
 #define PKG_FEEDS_CACHE_PREFIX "otherserver."
+// Download and install tasks: id prefix + package name, owned by the administrators.
+#define PKG_DOWNLOAD_TASK_PREFIX "@CORVPKG_DOWNLOAD_"
+#define PKG_TASK_OWNER "@administrators"
 
 // The OS version this library serves, sent with every query.
 constexpr unsigned PKG_QUERY_MAJOR = 6;
@@ -136,8 +143,105 @@ class CORVPKG_API CORVPackageServer {
     // the update-check job, and with `enabled` and not `all` the list `names`.
     static bool Save(bool enabled, bool all, const Json::Value& names);
 
+    // --- Downloads ------------------------------------------------------------------------
+    // A download runs under the task PKG_DOWNLOAD_TASK_PREFIX + name; the task's "progress"
+    // (1e-05 at the start, the fraction done, 1 finished, -1 failed) and "data" ({"id",
+    // "name", "size", "tmp_folder", "remote_link", "pid", "taskid", "success", "installing"
+    // (true from 99 %), "blqinst", and after the transfer "version", "nos_apps" or on
+    // failure "sec"/"key"}) are what the desktop follows. The file is
+    // <tmp_folder>/<task id>.
+    //
+    // Writes that record with progress 1e-05 and installs the SIGTERM handler. False for a
+    // null task, name or folder, or when the record can't be written.
+    static bool InitDownload(NOS::Task* task, const char* packageName, unsigned long long size,
+                             const char* url, const char* tmpFolder, bool blqinst, int pid);
+    // The whole transfer: waits for the package lock (about 3 hours, ending early on
+    // SIGTERM) and keeps it, downloads `url` with the store's fields (mode "install" or
+    // "upgrade" by whether `displayName` is installed), streaming to disk and hashing on
+    // the way, up to 4 attempts after a time-out or an unresolvable host (the file starts
+    // again from zero), requires status 200, compares the MD5 with `md5` (null or empty
+    // skips; a mismatch alone is only logged) and reads the file as a package. Removing the
+    // task record stops the transfer at once; SIGTERM stops it at the next step. A failure
+    // notifies `user` (null: the administrators), removes `tmpFolder` and marks the task;
+    // a cancel removes the task and says nothing. With `blqinst` false the task is finished
+    // (progress 1 or -1), otherwise left open for the install. getResult() is
+    // PKG_ERR_SERVER after a failed transfer.
+    static bool DownloadPackage(NOS::Task* task, const char* user, const char* displayName,
+                                const char* url, const char* md5, bool blqinst,
+                                const char* tmpFolder, const char* language, std::string& filePath);
+    // SIGTERM sets the process-wide cancel flag that isCanceled reads.
+    static void RegisterCancel();
+    static bool isCanceled();
+
+    // --- Install tasks ----------------------------------------------------------------------
+    // Whether a download or install of `packageName` is under way: its task's pid lives, or
+    // a finished download waits for the user. A stale task (dead pid, incomplete file) is
+    // removed with its folder, and the answer is false.
+    static bool IsInstalling(const char* packageName);
+    // Downloads and installs in this process under the package's task, and removes the
+    // task at the end; true at once when IsInstalling. Wizard packages without answers
+    // take the wizard's defaults. `volume` may be null for an upgrade.
+    static bool BackgroundInstall(const char* user, const char* volume, const char* packageName,
+                                  const char* displayName, const char* answersJson,
+                                  const char* language, unsigned long long size, const char* url,
+                                  const char* md5, bool startAfterInstall);
+    // Installs the downloaded file of `task`: checks it, waits up to 10800 s for the lock,
+    // installs with the signature check, turns worker messages into notifications, and
+    // ends with the final notification and the task's "success", "error", "message".
+    static bool Install(NOS::Task* task, const char* user, const char* volume,
+                        const char* packageName, const char* tmpFolder, bool startAfterInstall,
+                        const char* answersJson, const char* language);
+    // PackageManager::install of a file with the wizard's answers as JSON text. `error`
+    // receives the result code mapped for the desktop (PKG_ERR_FILE_ACCESS,
+    // PKG_ERR_BAD_ANSWERS of this call alone), `extra` "workerMessage", "installReboot" and
+    // the versions or dependencies of the refusal; `log` the package's own log. The file
+    // is removed after success.
+    static bool InstallCpkImpl(const char* user, const char* cpkPath, const char* volume,
+                               bool startAfterInstall, const char* answersJson,
+                               const char* language, std::string& log, PKG_ERRCODE& error,
+                               Json::Value& extra, bool upgradeFlag, bool verifySignature);
+    // BackgroundInstall of a store entry, started after install.
+    static bool DownloadInstatll(const char* user, const char* language, const char* volume,
+                                 const char* answersJson, const PackageInfo& info);
+    // Starts the installed package when it is stopped, leaves a running one or one stopped
+    // by the version limit, and downloads and installs anything else.
+    static bool StartOrDownloadInstall(const char* user, const char* language, const char* volume,
+                                       const char* answersJson, const PackageInfo& info);
+
+    // --- Updates ------------------------------------------------------------------------------
+    // Whether the installed `packageName` has a newer version in the maker's store or the
+    // feeds (a fresh list with `force`). False also when a list can't be had.
+    static bool PMSCheckUpgrade(bool force, const char* packageName, const char* language);
+
     // The class's result code, set by PMSGetPkgFromServer (and the install tasks).
     static int getResult();
 };
+
+// Merges `members` into the "data" of `task` as it is on disk, key by key. False when
+// the task can't be read or written.
+CORVPKG_API bool PMSUpdateTaskData(NOS::Task* task, const Json::Value& members);
+
+// The store entries (maker's with `makerStore`, else the feeds') of installed packages
+// that are newer (`upgradable`) or whose installation is broken (`repairable`), less those
+// that the version limits bar. False when the list can't be had.
+CORVPKG_API bool getUpdatableRepairablePackageList(bool force, bool makerStore,
+                                                   std::string language, bool upgradable,
+                                                   bool repairable, PackageBasicInfoMap& installed,
+                                                   Json::Value& out, bool sort);
+// Sends the count of updatable and repairable packages to the desktop's badge
+// (/usr/corv/bin/corvappnotify). False when a list can't be had.
+CORVPKG_API bool updateBadgeCount(bool force);
+// The update check. `scheduled`: a fresh list, automatic upgrades as the settings allow
+// (all packages, or those of the auto-update list whose entry allows a silent upgrade;
+// beta releases only over a beta, never below "auto_upgrade_from"), and the mail and
+// desktop notification of the rest. Unscheduled it only reports. `found` receives the
+// reported entries; `forceAll` upgrades all as if automatic update were on for all;
+// `onlyOverLimit` upgrades only packages whose installed version the limits bar. Always
+// updates the badge. False when a store list can't be had.
+CORVPKG_API bool PMSCheckUpgrade(bool scheduled, const char* user, const char* language,
+                                 std::vector<PackageInfo>* found, bool forceAll,
+                                 bool onlyOverLimit);
+CORVPKG_API bool PMSCheckUpgrade(bool scheduled, const char* user, const char* language,
+                                 std::vector<PackageInfo>* found);
 
 }  // namespace CORVPackageTool

@@ -33,6 +33,10 @@ int CORVPackageServer::getResult() {
     return g_serverResult;
 }
 
+void PMSSetServerResult(int code) {
+    g_serverResult = code;
+}
+
 bool CORVPackageServer::PMSGetPkgListFromServer(const char* language,
                                                 const std::vector<PackageInfo>& wanted,
                                                 std::vector<PackageInfo>& found) {

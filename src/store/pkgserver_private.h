@@ -14,6 +14,9 @@ namespace CORVPackageTool {
 // no good.
 void PMSSetLastStoreFailure(const std::string& words);
 
+// Sets the class result code that CORVPackageServer::getResult gives.
+void PMSSetServerResult(int code);
+
 // Whether a cache file is there and no more than an hour off the clock either way.
 // `st` receives its stat when not null.
 bool PMSIsCacheFresh(const std::string& path, struct stat* st);

@@ -95,6 +95,13 @@ std::vector<Json::Value> StoreServer::requests() const {
     return lines;
 }
 
+bool StoreServer::publish(const std::string& cpk) {
+    const std::string name = cpk.substr(cpk.rfind('/') + 1);
+    return VLIBCExec("/bin/cp", "-f", cpk.c_str(), (dir_ + "/" + name).c_str(), nullptr) == 0 &&
+           VLIBCExecl(CORV_STORE_PATH, VLIBC_EXEC_NULL_STDOUT | VLIBC_EXEC_WAIT, "index",
+                      dir_.c_str(), nullptr) == 0;
+}
+
 Json::Value storeEntry(const std::string& name, const std::string& version,
                        const Json::Value& deps) {
     Json::Value entry(Json::objectValue);

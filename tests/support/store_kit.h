@@ -30,6 +30,10 @@ class StoreServer {
     void setFaults(const Json::Value& rules);
     // The request log so far, one object per request.
     std::vector<Json::Value> requests() const;
+    // Copies the package file `cpk` into the store and indexes the store's files with
+    // "corv-store index" (the catalogue then has their link, size and md5). False when the
+    // index fails.
+    bool publish(const std::string& cpk);
 
   private:
     std::string dir_;

@@ -123,6 +123,16 @@ int cmdUninstall(const std::vector<std::string>& args);
 int cmdStore(const std::vector<std::string>& args);
 int cmdFeed(const std::vector<std::string>& args);
 int cmdAutoupdate(const std::vector<std::string>& args);
+int cmdInstallAny(const std::vector<std::string>& args);  // a file or a store's package
+int cmdUpgradeAny(const std::vector<std::string>& args);
+int cmdDownload(const std::vector<std::string>& args);
+int cmdTasks(const std::vector<std::string>& args);
+int cmdCancel(const std::vector<std::string>& args);
+int cmdUpdates(const std::vector<std::string>& args);
+int cmdChkUpgradePkg(const std::vector<std::string>& args);
+int cmdIcon(const std::vector<std::string>& args);
+extern const char kStoreInstallUsage[];
+extern const char kStoreTaskUsage[];
 int cmdStartAll(const std::vector<std::string>& args);
 int cmdStopAll(const std::vector<std::string>& args);
 int cmdServiceUp(const std::vector<std::string>& args);

@@ -219,10 +219,10 @@ const std::vector<Command>& commands() {
         {"service-down", "stop the packages that need a system service", kServiceUpUsage,
          cmdServiceDown},
         {"wizard", "show a package's wizard steps or defaults", kWizardUsage, cmdWizard},
-        {"install", "install a package file (or upgrade or repair what is installed)",
-         kInstallUsage, cmdInstall},
-        {"upgrade", "the same as install: upgrade an installed package from a file", kInstallUsage,
-         cmdUpgrade},
+        {"install", "install a package file or a store's package (or upgrade or repair)",
+         kStoreInstallUsage, cmdInstallAny},
+        {"upgrade", "the same as install; upgrade --all takes every update the stores offer",
+         kStoreInstallUsage, cmdUpgradeAny},
         {"repair", "the same as install: repair a broken package from its file", kInstallUsage,
          cmdRepair},
         {"uninstall", "uninstall a package",
@@ -256,6 +256,48 @@ const std::vector<Command>& commands() {
          "not JSON or not a package list, or it does not offer the package.\n"
          "Exit status: 0, 1 failed, 2 usage error.\n",
          cmdStore},
+        {"download", "download a store's package file with progress",
+         "usage: corvpkg download <name> [-o FILE] [--json] [--lang L]\n"
+         "\n"
+         "Downloads the package from the maker store, else from the feeds, under its task\n"
+         "record (see \"corvpkg tasks\"), with a progress bar on a terminal, checks its MD5\n"
+         "and that it reads as a package, and saves it as FILE (default\n"
+         "<name>-<version>.cpk in the current directory). It waits for any other package\n"
+         "operation first. \"corvpkg cancel <name>\" stops it.\n"
+         "Exit status: 0, 1 failed or canceled, 2 usage error.\n",
+         cmdDownload},
+        {"tasks", "the downloads and installs under way and their progress", kStoreTaskUsage,
+         cmdTasks},
+        {"cancel", "cancel the download of a store's package", kStoreTaskUsage, cmdCancel},
+        {"updates", "the installed packages that a store offers newer, and why not the rest",
+         "usage: corvpkg updates [--refresh] [--json] [--lang L]\n"
+         "\n"
+         "Lists the installed packages whose newer versions the maker store or a feed\n"
+         "offers (beta releases over a stable installation are marked), then the other\n"
+         "installed packages with the reason: no store offers it, the store's version is\n"
+         "not newer, or the version limits bar it. --refresh asks the stores again\n"
+         "instead of the hour's cache. \"corvpkg upgrade --all\" installs the updates.\n"
+         "Exit status: 0, 1 the lists could not be had, 2 usage error.\n",
+         cmdUpdates},
+        {"chkupgradepkg", "the scheduled update check (the job autopkgupgrade runs it)",
+         "usage: corvpkg chkupgradepkg [--json] [--lang L]\n"
+         "\n"
+         "Asks the stores afresh, upgrades the packages chosen for automatic update\n"
+         "(\"corvpkg autoupdate\") whose new version allows a silent upgrade, and tells\n"
+         "the administrators about the rest: a desktop notification and a mail, as\n"
+         "upgrade_pkg_nos_notification and upgrade_pkg_email_notification in\n"
+         "/etc/corvinfo.conf say. Updates the desktop's badge. Prints what it reported.\n"
+         "Exit status: 0, 1 the lists could not be had, 2 usage error.\n",
+         cmdChkUpgradePkg},
+        {"icon", "a package's icon as a PNG or JPEG file",
+         "usage: corvpkg icon <name> [-o FILE] [--256] [--json]\n"
+         "\n"
+         "The icon of the installed package (from its INFO), else the store's thumbnail,\n"
+         "through the image cache; --256 the large one. Prints the path of the cached\n"
+         "file, or copies it to FILE. A store's icon that is not a PNG or JPEG or not\n"
+         "under 2 MiB is refused.\n"
+         "Exit status: 0, 1 no icon, 2 usage error.\n",
+         cmdIcon},
         {"feed", "the feed servers: add <url>, remove <url>, list",
          "usage: corvpkg feed add <url> [--json]\n"
          "       corvpkg feed remove <url> [--json]\n"

@@ -229,6 +229,11 @@ int VLIBCPclose(FILE* stream);
 pid_t VLIBCProcFork();
 int VLIBCProcAlive(pid_t pid);  // 1 when the process exists
 
+// Decodes the base64 text `in` (`inLength` characters; blanks and line breaks are
+// skipped, "=" ends the data) into `out`. The byte count, or -1: ERR_BAD_PARAMETERS for a
+// character outside the alphabet, ERR_BUF_TOO_SMALL when `outSize` bytes do not hold it.
+int VLIBCBase64Decode(const char* in, int inLength, unsigned char* out, int outSize);
+
 // Whether the machine is a small-box model whose only volume is /volume1.
 // The reference platform answers from key "dockette" ("yes") of the defaults file.
 int VLIBCIsDockette();

@@ -6,6 +6,7 @@
 #include <fstream>
 
 #include "corvpkg/pkglog.h"
+#include "corvpkg/pkgserver.h"
 #include "queries.h"
 #include "routes.h"
 
@@ -74,6 +75,15 @@ void storeInstall(Center& center, const httplib::Request& request, httplib::Resp
         std::lock_guard<std::mutex> hold(queryLock());
         if (!body["packages"].isArray() || !storePlan(body["packages"], plan, why)) {
             sendError(response, 400, "not_in_store", why.empty() ? "name the packages" : why);
+            return;
+        }
+    }
+    // The engine's own background installs (the update check, another client) keep a task
+    // record per package; a second download of the same package would race them.
+    for (const Json::Value& step : plan) {
+        if (CORVPackageTool::CORVPackageServer::IsInstalling(step["package"].asCString())) {
+            sendError(response, 409, "installing",
+                      step["package"].asString() + " is being downloaded or installed already");
             return;
         }
     }

@@ -117,6 +117,37 @@ class Uploads(unittest.TestCase):
         self.assertEqual(self.client.call("GET", "/api/tasks/" + task["id"])[0], 401)
 
 
+class StoreTasks(unittest.TestCase):
+    def test_a_download_waiting_for_answers_cancels_and_stays_private(self):
+        client = Client()
+        client.login("alice", "alice-secret")
+        status, task = client.call("POST", "/api/store/install", {"packages": ["greeter"]})
+        self.assertEqual(status, 202, task)
+        ready = client.wait(task["id"], until=("ready", "failed"))
+        self.assertEqual(ready["state"], "ready", ready)
+        # hello, which greeter needs and which is not installed, comes first.
+        self.assertEqual([step["package"] for step in ready["plan"]], ["hello", "greeter"])
+        self.assertEqual([q["package"] for q in ready["questions"]], ["hello", "greeter"])
+        keys = [item["key"] for step in ready["questions"][1]["wizard"] for item in step["items"]]
+        self.assertEqual(keys, ["GREETER_GREETING", "GREETER_PORT"])
+
+        carol = Client()
+        carol.login("carol", "carol-secret")
+        for method, path in [("GET", ""), ("POST", "/cancel"), ("POST", "/install")]:
+            with self.subTest(other_user=method + path):
+                status, _ = carol.call(method, "/api/tasks/" + task["id"] + path,
+                                       {} if method == "POST" else None)
+                self.assertEqual(status, 404)
+
+        status, cancelled = client.call("POST", "/api/tasks/" + task["id"] + "/cancel")
+        self.assertEqual((status, cancelled["state"]), (200, "cancelled"))
+        self.assertEqual(sorted(os.listdir("/tmp/center-state/" + task["id"])),
+                         ["owner.json", "request.json", "state.json"])
+        status, _ = client.call("POST", "/api/tasks/" + task["id"] + "/install", {})
+        self.assertEqual(status, 409)
+        self.assertEqual(client.call("GET", "/api/packages")[1], [])
+
+
 if __name__ == "__main__":
     result = unittest.main(argv=[sys.argv[0], "-v"], exit=False).result
     sys.exit(0 if result.wasSuccessful() else 1)

@@ -27,11 +27,12 @@ pids+=($!)
 "$store" serve "$out/published" --listen 127.0.0.1:8481 --log /tmp/feed.log >/dev/null &
 pids+=($!)
 
-# alice administers the machine; bob is a plain user.
+# alice and carol administer the machine; bob is a plain user.
 groupadd -f administrators
 useradd -M -G administrators alice
+useradd -M -G administrators carol
 useradd -M bob
-printf 'alice:alice-secret\nbob:bob-secret\n' | chpasswd
+printf 'alice:alice-secret\ncarol:carol-secret\nbob:bob-secret\n' | chpasswd
 cp "$source_dir/tools/center/pam/corv-center" /etc/pam.d/corv-center
 
 "$center" --listen 127.0.0.1:8490 --state /tmp/center-state --max-upload 1 \

@@ -8,6 +8,7 @@ import subprocess
 import sys
 import time
 import unittest
+import urllib.request
 
 from selenium import webdriver
 from selenium.common.exceptions import NoSuchElementException, StaleElementReferenceException
@@ -105,6 +106,10 @@ class PackageCenterInBrowser(unittest.TestCase):
         self.text_in("#installed-greeter .status", "running")
         self.text_in("#installed-hello .status", "running")
         self.shot("installed")
+        # The wizard's answers reached the package: it answers on the port chosen, with
+        # the greeting given.
+        with urllib.request.urlopen("http://127.0.0.1:9123/", timeout=10) as answer:
+            self.assertIn("Hello from the browser", answer.read().decode())
 
         # Stop greeter from its details.
         self.click("#installed-greeter .details-link")

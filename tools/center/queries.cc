@@ -129,10 +129,21 @@ Json::Value storePackages(bool refresh) {
 }
 
 Json::Value availableUpdates(bool refresh) {
-    Json::Value store = storePackages(refresh);
+    // The engine's own list, as the update check sees it: newer entries of the maker's
+    // store and of the feeds, less those the version limits bar.
+    PackageManager pm;
+    PackageBasicInfoMap installed = pm.enumPackageMap(PKG_INFO_MASK_ALL);
     Json::Value out(Json::arrayValue);
-    for (const Json::Value& entry : store["packages"]) {
-        if (entry["action"].asString() == "upgrade") {
+    for (bool maker : {true, false}) {
+        Json::Value entries;
+        if (!getUpdatableRepairablePackageList(refresh, maker, kLanguage, true, false, installed,
+                                               entries, maker) ||
+            !entries.isArray()) {
+            continue;
+        }
+        for (Json::Value entry : entries) {
+            entry["installed_version"] = installed[entry["package"].asString()].version;
+            entry["action"] = "upgrade";
             out.append(entry);
         }
     }

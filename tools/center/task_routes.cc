@@ -4,13 +4,17 @@
 #include <unistd.h>
 
 #include <fstream>
+#include <memory>
 
+#include "corv/task.h"
 #include "corvpkg/pkglog.h"
 #include "corvpkg/pkgserver.h"
 #include "queries.h"
 #include "routes.h"
 
 namespace center {
+
+using CORVPackageTool::CORVPackageServer;
 
 namespace {
 
@@ -19,15 +23,32 @@ long long sizeOf(const std::string& path) {
     return stat(path.c_str(), &st) == 0 ? static_cast<long long>(st.st_size) : 0;
 }
 
+// The progress of the engine's download task of `name`, 0 to 1.
+double downloadProgress(const std::string& name) {
+    try {
+        NOS::TaskMgr tasks(PKG_TASK_OWNER);
+        std::unique_ptr<NOS::Task> task(tasks.getTask(PKG_DOWNLOAD_TASK_PREFIX + name));
+        const double progress = task ? task->getProperty("progress").asDouble() : 0.0;
+        return std::max(0.0, std::min(1.0, progress));
+    } catch (const std::exception&) {
+        return 0.0;
+    }
+}
+
 // 0 to 1, from the bytes downloaded or the packages installed so far.
 double progressOf(const std::string& dir, const Json::Value& state) {
     const std::string now = state["state"].asString();
     if (now == "downloading") {
         long long total = 0, have = 0;
         for (const Json::Value& entry : state["plan"]) {
-            const std::string base = dir + "/" + entry["package"].asString() + ".cpk";
-            total += entry["size"].asInt64();
-            have += sizeOf(base) + sizeOf(base + ".part");
+            const std::string name = entry["package"].asString();
+            const long long size = entry["size"].asInt64();
+            total += size;
+            if (sizeOf(dir + "/" + name + ".cpk") > 0) {
+                have += size;
+            } else {
+                have += static_cast<long long>(size * downloadProgress(name));
+            }
         }
         return total > 0 ? std::min(1.0, static_cast<double>(have) / total) : 0.0;
     }

@@ -1,14 +1,16 @@
 // The worker process of a task (tasks.h): one download, install, start, stop or uninstall
 // through libcorvpkg, its progress and outcome written to state.json as it goes.
-#include <openssl/evp.h>
 #include <stdio.h>
 #include <unistd.h>
 
-#include <fstream>
+#include <filesystem>
+#include <memory>
 #include <string>
 
+#include "corv/task.h"
 #include "corvpkg/corvpkg.h"
 #include "corvpkg/pkgcurltool.h"
+#include "corvpkg/pkgserver.h"
 #include "corvpkg/pkgvolume.h"
 #include "corvpkg/pkgwizard.h"
 #include "results.h"
@@ -39,31 +41,6 @@ class StateWriter {
     Json::Value state_{Json::objectValue};
 };
 
-// Lower-case hexadecimal MD5 of a file's bytes, "" when it cannot be read.
-std::string fileMd5(const std::string& path) {
-    std::ifstream in(path, std::ios::binary);
-    EVP_MD_CTX* context = EVP_MD_CTX_new();
-    if (!in || context == nullptr || EVP_DigestInit_ex(context, EVP_md5(), nullptr) != 1) {
-        EVP_MD_CTX_free(context);
-        return "";
-    }
-    char buffer[65536];
-    while (in.read(buffer, sizeof buffer) || in.gcount() > 0) {
-        EVP_DigestUpdate(context, buffer, static_cast<size_t>(in.gcount()));
-    }
-    unsigned char digest[EVP_MAX_MD_SIZE];
-    unsigned int length = 0;
-    EVP_DigestFinal_ex(context, digest, &length);
-    EVP_MD_CTX_free(context);
-    static const char kHex[] = "0123456789abcdef";
-    std::string out;
-    for (unsigned int i = 0; i < length; ++i) {
-        out += kHex[digest[i] >> 4];
-        out += kHex[digest[i] & 15];
-    }
-    return out;
-}
-
 Json::Value failure(const std::string& meaning, int code = PKG_ERR_SERVER) {
     Json::Value result = describeResult(code);
     result["meaning"] = meaning;
@@ -71,34 +48,72 @@ Json::Value failure(const std::string& meaning, int code = PKG_ERR_SERVER) {
     return result;
 }
 
-// Fetches every file of the plan; the page sees the bytes grow under their final names'
-// ".part" and computes the progress from the sizes the plan gives.
+// Fetches one store entry as the engine's own download task ("@CORVPKG_DOWNLOAD_<name>",
+// whose progress the page is shown) into the engine's download folder, and moves the file
+// into the task directory. The engine's record goes when the file is here, so that it
+// does not read as an install under way. False with the result in `state`; on a cancel
+// (SIGTERM from the server) `canceled` is set and nothing is written.
+bool fetch(const std::string& dir, const Json::Value& entry, const std::string& user,
+           StateWriter& state, std::string& file, bool& canceled) {
+    const std::string name = entry["package"].asString();
+    const std::string link = entry["link"].asString();
+    const std::string md5 = entry["md5"].asString();
+    std::string folder;
+    if (!PMSCreateDownloadTmpDir(nullptr, name.c_str(), entry["size"].asUInt64(), folder)) {
+        state.value()["result"] = failure("there is no room to download " + name, PKG_ERR_NO_SPACE);
+        return false;
+    }
+    std::unique_ptr<NOS::Task> task;
+    try {
+        task = std::make_unique<NOS::Task>(PKG_TASK_OWNER, PKG_DOWNLOAD_TASK_PREFIX + name);
+    } catch (const std::exception&) {
+        state.value()["result"] = failure(name + " is being downloaded or installed already");
+        std::filesystem::remove_all(folder);
+        return false;
+    }
+    std::string path;
+    bool ok = CORVPackageServer::InitDownload(task.get(), name.c_str(), entry["size"].asUInt64(),
+                                              link.c_str(), folder.c_str(), false, getpid()) &&
+              CORVPackageServer::DownloadPackage(task.get(), user.c_str(), name.c_str(),
+                                                 link.c_str(), md5.empty() ? nullptr : md5.c_str(),
+                                                 false, folder.c_str(), kLanguage, path);
+    task->reload();
+    const std::string key = task->getProperty("data").get("key", "").asString();
+    canceled = CORVPackageServer::isCanceled();
+    std::error_code error;
+    if (ok && key.empty()) {
+        file = dir + "/" + name + ".cpk";
+        std::filesystem::copy_file(path, file, std::filesystem::copy_options::overwrite_existing,
+                                   error);
+        ok = !error;
+    }
+    task->remove();
+    std::filesystem::remove_all(folder, error);
+    if (!ok && !canceled) {
+        const std::string why = key == "pkgmgr_pkg_broken"
+                                    ? "the file is not the package the store describes"
+                                    : PMSGetLastStoreFailure();
+        state.value()["result"] =
+            failure("the download of " + name + " failed" + (why.empty() ? "" : ": " + why));
+    }
+    return ok;
+}
+
 int download(const std::string& dir, const Json::Value& request, StateWriter& state) {
     state.value()["plan"] = request["plan"];
     state.set("downloading");
     Json::Value files(Json::arrayValue);
     for (const Json::Value& entry : request["plan"]) {
-        const std::string name = entry["package"].asString();
-        const std::string part = dir + "/" + name + ".cpk.part";
-        const std::string file = dir + "/" + name + ".cpk";
-        if (!PMSDownloadFile(entry["link"].asCString(), part.c_str(), nullptr, nullptr, nullptr)) {
-            const std::string why = PMSGetLastStoreFailure();
-            state.value()["result"] =
-                failure("the download of " + name + " failed" + (why.empty() ? "" : ": " + why));
-            state.set("failed");
+        std::string file;
+        bool canceled = false;
+        if (!fetch(dir, entry, request["user"].asString(), state, file, canceled)) {
+            if (!canceled) {
+                state.set("failed");
+            }
             return 1;
         }
-        const std::string md5 = entry["md5"].asString();
-        if (!md5.empty() && fileMd5(part) != md5) {
-            unlink(part.c_str());
-            state.value()["result"] =
-                failure("the file of " + name + " does not have the checksum the store gives");
-            state.set("failed");
-            return 1;
-        }
-        rename(part.c_str(), file.c_str());
         Json::Value one(Json::objectValue);
-        one["package"] = name;
+        one["package"] = entry["package"];
         one["version"] = entry["version"];
         one["file"] = file;
         files.append(one);

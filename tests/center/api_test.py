@@ -1,8 +1,10 @@
 """The security rules of corv-center's API, asked over HTTP: no session, a wrong CSRF
 token, a wrong password, a user who is no administrator, uploads over the cap or that are
 no package, names that are no package names; and an upload installed end to end."""
+import json
 import os
 import sys
+import time
 import unittest
 import urllib.parse
 
@@ -59,6 +61,7 @@ class Csrf(unittest.TestCase):
         client.login("alice", "alice-secret")
         other = Client()
         other.login("alice", "alice-secret")
+        before = len(client.call("GET", "/api/tasks")[1])
         tokens = [("missing", ""), ("wrong", "0" * 64), ("another session's", other.csrf),
                   ("shortened", client.csrf[:-1])]
         for label, token in tokens:
@@ -68,7 +71,7 @@ class Csrf(unittest.TestCase):
                 self.assertEqual((status, body["error"]), (403, "csrf"))
                 status, body = client.upload("x.cpk", b"x", csrf=token or "-")
                 self.assertEqual((status, body["error"]), (403, "csrf"))
-        self.assertEqual(client.call("GET", "/api/tasks")[1], [])
+        self.assertEqual(len(client.call("GET", "/api/tasks")[1]), before)
 
 
 class Uploads(unittest.TestCase):
@@ -146,6 +149,35 @@ class StoreTasks(unittest.TestCase):
         status, _ = client.call("POST", "/api/tasks/" + task["id"] + "/install", {})
         self.assertEqual(status, 409)
         self.assertEqual(client.call("GET", "/api/packages")[1], [])
+
+
+class CancelDownload(unittest.TestCase):
+    def test_a_stalled_download_cancels_and_leaves_nothing(self):
+        faults = os.path.join(os.environ["CENTER_FEED_DIR"], "faults.json")
+        with open(faults, "w") as file:
+            json.dump([{"path": "/hello-*", "stall_after": 1000, "stall_seconds": 30}], file)
+        try:
+            client = Client()
+            client.login("alice", "alice-secret")
+            status, task = client.call("POST", "/api/store/install", {"packages": ["hello"]})
+            self.assertEqual(status, 202, task)
+            client.wait(task["id"], until=("downloading",))
+            status, cancelled = client.call("POST", "/api/tasks/" + task["id"] + "/cancel")
+            self.assertEqual((status, cancelled["state"]), (200, "cancelled"))
+            # The worker goes, and with it the engine's own download record: a new
+            # download of hello is not refused as one under way.
+            deadline = time.time() + 20
+            while time.time() < deadline:
+                status, again = client.call("POST", "/api/store/install", {"packages": ["hello"]})
+                if status == 202:
+                    break
+                time.sleep(0.2)
+            self.assertEqual(status, 202, again)
+            client.call("POST", "/api/tasks/" + again["id"] + "/cancel")
+            self.assertEqual(client.call("GET", "/api/tasks/" + task["id"])[1]["state"],
+                             "cancelled")
+        finally:
+            os.unlink(faults)
 
 
 if __name__ == "__main__":

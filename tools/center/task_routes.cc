@@ -35,6 +35,23 @@ double downloadProgress(const std::string& name) {
     }
 }
 
+// Removes the engine's download records that the worker `pid` holds: that stops a
+// transfer at once, where SIGTERM waits for the next step, and frees the packages for the
+// next download. Records of other processes are left alone.
+void dropDownloadRecords(const Json::Value& plan, pid_t pid) {
+    for (const Json::Value& entry : plan) {
+        try {
+            NOS::TaskMgr tasks(PKG_TASK_OWNER);
+            std::unique_ptr<NOS::Task> task(
+                tasks.getTask(PKG_DOWNLOAD_TASK_PREFIX + entry["package"].asString()));
+            if (task && pid > 0 && task->getProperty("pid").asInt64() == pid) {
+                task->remove();
+            }
+        } catch (const std::exception&) {
+        }
+    }
+}
+
 // 0 to 1, from the bytes downloaded or the packages installed so far.
 double progressOf(const std::string& dir, const Json::Value& state) {
     const std::string now = state["state"].asString();
@@ -219,10 +236,13 @@ void addTaskRoutes(httplib::Server& server, Center& center) {
                     if (!ownTask(center, request, response, id)) {
                         return;
                     }
+                    const pid_t worker = center.tasks.workerOf(id);
+                    const Json::Value plan = center.tasks.state(id)["plan"];
                     if (!center.tasks.cancel(id, why)) {
                         sendError(response, 409, "not_cancellable", why);
                         return;
                     }
+                    dropDownloadRecords(plan, worker);
                     sendTask(center, id, response);
                 });
 }

@@ -137,6 +137,12 @@ void TaskTable::reap(const std::string& id, pid_t pid) {
     }
 }
 
+pid_t TaskTable::workerOf(const std::string& id) {
+    std::lock_guard<std::mutex> hold(mutex_);
+    auto worker = workers_.find(id);
+    return worker == workers_.end() ? -1 : worker->second;
+}
+
 bool TaskTable::busy(const std::string& id) {
     std::lock_guard<std::mutex> hold(mutex_);
     return workers_.count(id) != 0;

@@ -42,6 +42,8 @@ class TaskTable {
     // Ends the worker of a task that has not begun to change the system (a download, or a
     // task that waits for its answers) and removes its files. False with `why` otherwise.
     bool cancel(const std::string& id, std::string& why);
+    // The process id of the task's running worker, or -1.
+    pid_t workerOf(const std::string& id);
     // The state as the worker left it ({"state": "queued"} before its first word).
     Json::Value state(const std::string& id);
     // Every task directory of `owner`, newest first, as their states with "id".

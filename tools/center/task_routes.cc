@@ -149,11 +149,15 @@ void upload(Center& center, const httplib::Request& request, httplib::Response& 
     const httplib::MultipartFormData file = request.get_file_value("file");
     const Session session = sessionOf(request);
     const std::string id = center.tasks.create(session.user);
+    if (id.empty()) {
+        sendError(response, 500, "task", "no task could be made for the file");
+        return;
+    }
     const std::string staged = center.tasks.dir(id) + "/upload.cpk";
     {
         std::ofstream out(staged, std::ios::binary | std::ios::trunc);
         out.write(file.content.data(), static_cast<std::streamsize>(file.content.size()));
-        if (id.empty() || !out.flush()) {
+        if (!out.flush()) {
             sendError(response, 500, "upload", "the file could not be stored");
             return;
         }

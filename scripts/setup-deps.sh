@@ -20,6 +20,7 @@ packages=(
     libsqlite3-dev sqlite3 # the reference platform's search and media index
     pigz # the gzip that the reference platform gives tar for package payloads
     clang libclang-rt-14-dev # libFuzzer and the sanitizers (scripts/fuzz.sh, scripts/test-asan.sh)
+    chromium chromium-driver python3-selenium # the Package Center's tests in a headless browser
 )
 
 missing=()

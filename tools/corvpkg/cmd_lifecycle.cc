@@ -7,6 +7,7 @@
 #include "cli.h"
 #include "corvpkg/corvpkg.h"
 #include "corvpkg/pkgvolume.h"
+#include "progress.h"
 
 namespace cli {
 
@@ -73,6 +74,7 @@ int startStop(const std::vector<std::string>& args, const char* command, bool st
         return status;
     }
     const std::string& name = opts.positional[0];
+    failureContext()["package"] = name;
     PackageManager pm;
     LogCapture log;
     // Without this a name that is not installed has no dependency order and counts as done.
@@ -91,6 +93,8 @@ int startStop(const std::vector<std::string>& args, const char* command, bool st
         }
     }
     int outcome = 0;
+    ProgressDisplay display(command);
+    display.follow(name);
     if (restart) {
         outcome = pm.serviceControlRestart(name);
     } else {
@@ -98,6 +102,7 @@ int startStop(const std::vector<std::string>& args, const char* command, bool st
             pm.serviceControl(static_cast<PKG_INSTALLATION_TYPE>(start ? 8 : 0x10), name, start,
                               language, optionalText(opts, "--user"), nullptr, true, true);
     }
+    display.finish();
     int status = printOperationOutcome(
         opts, pm, outcome, restart ? "restarted" : (start ? "started" : "stopped"), name, log);
     if (status == EXIT_OK && !opts.json && !dependents.empty()) {

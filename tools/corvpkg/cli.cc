@@ -190,7 +190,8 @@ int printFailure(bool json, int code, const std::string& reason, const Json::Val
         return EXIT_FAILED;
     }
     fprintf(stderr, "error: %s\n", text.sentence.c_str());
-    if (!reason.empty() && reason != text.sentence) {
+    // The reason adds what the sentence does not say already.
+    if (!reason.empty() && text.sentence.find(reason) == std::string::npos) {
         fprintf(stderr, "  %s\n", reason.c_str());
     }
     if (!text.remedy.empty()) {

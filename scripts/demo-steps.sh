@@ -141,6 +141,9 @@ ask "hello's daemon answers" 8765 "hello from a corvpkg package"
 step "greeter's install wizard asks two questions" 0 wizard $out/greeter-1.0.0-0001.cpk
 step "Installing without answers is refused with the questions" 2 \
     install $out/greeter-1.0.0-0001.cpk --no-verify
+show "A misspelt answer key" "printf '%s\n' '{\"GREETER_PROT\": \"9123\"}' >/tmp/misspelt.json && cat /tmp/misspelt.json"
+step "is refused with the keys the wizard asks for" 1 \
+    install $out/greeter-1.0.0-0001.cpk --no-verify --answers /tmp/misspelt.json
 show "Our answers" "printf '%s\n' '{\"GREETER_GREETING\": \"Hello from the demo\", \"GREETER_PORT\": \"9123\"}' >/tmp/answers.json && cat /tmp/answers.json"
 step "Install greeter with the answers: its user, its job, its cron job" 0 \
     install $out/greeter-1.0.0-0001.cpk --no-verify --answers /tmp/answers.json

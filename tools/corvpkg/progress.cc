@@ -31,9 +31,14 @@ long long nowMs() {
         .count();
 }
 
-std::string inMiB(unsigned long long bytes) {
+// Bytes as a person reads them: KiB below one MiB, MiB with one decimal above.
+std::string sizeText(unsigned long long bytes) {
     char text[32];
-    snprintf(text, sizeof(text), "%.1f MiB", static_cast<double>(bytes) / (1024.0 * 1024.0));
+    if (bytes < (1ULL << 20)) {
+        snprintf(text, sizeof(text), "%llu KiB", (bytes + 1023) / 1024);
+    } else {
+        snprintf(text, sizeof(text), "%.1f MiB", static_cast<double>(bytes) / (1024.0 * 1024.0));
+    }
     return text;
 }
 
@@ -343,9 +348,9 @@ void ProgressDisplay::redraw() {
             const int width = 24;
             const int filled = static_cast<int>(shown * width / unpackBytes_);
             text += "  [" + std::string(filled, '#') + std::string(width - filled, '.') + "] " +
-                    inMiB(shown) + " of " + inMiB(unpackBytes_);
+                    sizeText(shown) + " of " + sizeText(unpackBytes_);
         } else {
-            text += "  " + inMiB(done);
+            text += "  " + sizeText(done);
         }
     }
     fprintf(stderr, "\r\033[K%s", text.c_str());

@@ -20,6 +20,25 @@ const char* optionalText(const CommonOptions& opts, const char* name) {
     return it == opts.options.end() ? nullptr : it->second.c_str();
 }
 
+// The resource workers' messages ([{"sec", "key", "params"}]) in words, one line each.
+void printWorkerMessages(const Json::Value& messages) {
+    if (!messages.isArray()) {
+        return;
+    }
+    for (const Json::Value& message : messages) {
+        if (!message.isObject() || !message["key"].isString()) {
+            continue;
+        }
+        Json::Value array(Json::arrayValue);
+        array.append(message["sec"].asString() + ":" + message["key"].asString());
+        for (const Json::Value& param : message["params"]) {
+            array.append(param.isString() ? param.asString() : toString(param));
+        }
+        fprintf(stderr, "  %s\n",
+                corvtext::oneLine(corvtext::textForMessage(array, failureContext())).c_str());
+    }
+}
+
 }  // namespace
 
 int printOperationOutcome(const CommonOptions& opts, PackageManager& pm, int outcome,
@@ -44,8 +63,12 @@ int printOperationOutcome(const CommonOptions& opts, PackageManager& pm, int out
         }
     }
     if (outcome == 0) {
-        return printFailure(opts.json, pm.getResult(), log.reasons(),
-                            data.empty() ? Json::Value() : data);
+        const int status = printFailure(opts.json, pm.getResult(), log.reasons(),
+                                        data.empty() ? Json::Value() : data);
+        if (!opts.json) {
+            printWorkerMessages(data["worker_msg"]);
+        }
+        return status;
     }
     if (opts.json) {
         Json::Value out(Json::objectValue);
@@ -58,9 +81,7 @@ int printOperationOutcome(const CommonOptions& opts, PackageManager& pm, int out
         printf("%s\n", toString(out).c_str());
     } else {
         printf("%s %s\n", done, name.c_str());
-        if (data.isMember("worker_msg")) {
-            printf("worker_msg: %s\n", toString(data["worker_msg"]).c_str());
-        }
+        printWorkerMessages(data["worker_msg"]);
     }
     return EXIT_OK;
 }

@@ -13,12 +13,13 @@ cd "$(dirname "${BASH_SOURCE[0]}")/.."
 out=/tmp/examples
 failures=0
 
-# step TITLE EXPECTED_STATUS ARGS...: runs corvpkg ARGS and checks its exit status.
+# step TITLE EXPECTED_STATUS ARGS...: runs corvpkg ARGS and checks its exit status. Nothing
+# is typed in: on a terminal corvpkg would ask the wizard's questions.
 step() {
     local title=$1 expected=$2
     shift 2
     printf '\n==== %s\n$ corvpkg %s\n' "$title" "$*"
-    "$corvpkg" "$@"
+    "$corvpkg" "$@" </dev/null
     local status=$?
     printf '(exit status %d)\n' "$status"
     if [ "$status" -ne "$expected" ]; then
@@ -131,13 +132,18 @@ offers "greeter's store entry: what it needs, where to download it" \
 show "What the feed store saw: one JSON line per request" \
     "cut -c1-160 $out.requests.log"
 
-step "Install hello (unsigned, hence --no-verify); it starts after the install" 0 \
-    install $out/hello-1.0.0-0001.cpk --no-verify
+# On a terminal (script(1) makes one even when the demo's output goes to a file) each phase
+# is one line, redrawn in place; through a pipe the phases are plain lines.
+show "Install hello (unsigned, hence --no-verify) as a terminal shows it; it starts after the install" \
+    "script -qec '$corvpkg install $out/hello-1.0.0-0001.cpk --no-verify' /dev/null </dev/null"
 ask "hello's daemon answers" 8765 "hello from a corvpkg package"
 
 step "greeter's install wizard asks two questions" 0 wizard $out/greeter-1.0.0-0001.cpk
 step "Installing without answers is refused with the questions" 2 \
     install $out/greeter-1.0.0-0001.cpk --no-verify
+show "A misspelt answer key" "printf '%s\n' '{\"GREETER_PROT\": \"9123\"}' >/tmp/misspelt.json && cat /tmp/misspelt.json"
+step "is refused with the keys the wizard asks for" 1 \
+    install $out/greeter-1.0.0-0001.cpk --no-verify --answers /tmp/misspelt.json
 show "Our answers" "printf '%s\n' '{\"GREETER_GREETING\": \"Hello from the demo\", \"GREETER_PORT\": \"9123\"}' >/tmp/answers.json && cat /tmp/answers.json"
 step "Install greeter with the answers: its user, its job, its cron job" 0 \
     install $out/greeter-1.0.0-0001.cpk --no-verify --answers /tmp/answers.json

@@ -226,8 +226,10 @@ TEST(CliLifecycle, FullVolumeIsSaidInWords) {
         const char* volume;
         const char* words;  // what the code alone would not say
     } cases[] = {
-        {{"install", file, "--no-verify"}, "/volume1", "PKG_ERR_NO_SPACE"},
-        {{"install", file, "--no-verify", "--volume", "/volume2"}, "/volume2", "PKG_ERR_NO_SPACE"},
+        {{"install", file, "--no-verify"}, "/volume1", "not enough free space on /volume1: "},
+        {{"install", file, "--no-verify", "--volume", "/volume2"},
+         "/volume2",
+         "not enough free space on /volume2: "},
     };
     for (const Case& c : cases) {
         // The check unpacks the payload on the first volume with 10 MiB free: leave 11 there,
@@ -242,9 +244,6 @@ TEST(CliLifecycle, FullVolumeIsSaidInWords) {
         unlink("/volume1/fill");
         EXPECT_EQ(r.status, 1) << c.args[0];
         EXPECT_NE((r.out + r.err).find(c.words), std::string::npos) << r.out << r.err;
-        EXPECT_NE(r.err.find(std::string("the volume ") + c.volume + " is full: "),
-                  std::string::npos)
-            << r.out << r.err;
     }
     EXPECT_FALSE(testutil::exists("/var/packages/big"));
     umount2("/volume2", MNT_DETACH);

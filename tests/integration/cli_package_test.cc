@@ -80,7 +80,9 @@ TEST(CliPackage, CheckAndInspectRefuseWhatIsNoPackageFile) {
         {{"build", "/tmp/nosource"}, 1, "PKG_ERR_BROKEN"},
     };
     for (const auto& c : cases) {
-        auto r = run(kCli, c.args);
+        std::vector<std::string> args = c.args;
+        args.push_back("-v");  // the code's name as well as the words
+        auto r = run(kCli, args);
         EXPECT_EQ(r.status, c.status) << testing::PrintToString(c.args);
         EXPECT_NE((r.out + r.err).find(c.text), std::string::npos)
             << testing::PrintToString(c.args) << "\n"

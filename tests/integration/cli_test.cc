@@ -79,9 +79,12 @@ TEST(Cli, InfoFailuresNameTheCodeAndTheReason) {
         {"/tmp/port", "key [adminport] 70000 is illegal"},
     };
     for (const auto& c : cases) {
-        auto r = run(kCli, {"info", c.dir});
+        auto r = run(kCli, {"info", c.dir, "-v"});
         EXPECT_EQ(r.status, 1) << c.dir;
-        EXPECT_NE(r.err.find("error: PKG_ERR_BROKEN (150): "), std::string::npos) << r.err;
+        EXPECT_NE(r.err.find("error: The directory " + c.dir + " is not a package"),
+                  std::string::npos)
+            << r.err;
+        EXPECT_NE(r.err.find("result: PKG_ERR_BROKEN (150)"), std::string::npos) << r.err;
         EXPECT_NE(r.err.find(c.reason), std::string::npos) << c.dir << ": " << r.err;
 
         auto j = run(kCli, {"info", c.dir, "--json"});

@@ -12,7 +12,8 @@ mv "$prefix/first" "$prefix/moved"
 root=$prefix/moved
 
 fail() { echo "FAIL: $*" >&2; exit 1; }
-for tool in sbin/initctl bin/init-check.sh sbin/corvpkgctl bin/corv-codesign sbin/corv-platform-setup; do
+for tool in sbin/initctl bin/init-check.sh sbin/corvpkgctl bin/corv-codesign sbin/corv-platform-setup \
+    lib/security lib64/security lib/x86_64-linux-gnu/security bin/corvcrt bin/corv-selfcheck; do
     [[ ! -e $root/$tool ]] || fail "the stand-in $tool was installed without being asked for"
 done
 [[ -x $root/bin/corvpkg ]] || fail "corvpkg not installed"

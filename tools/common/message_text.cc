@@ -49,6 +49,10 @@ const CodeEntry kCodes[] = {
       "file names what is wrong with it.",
       "Download the package again."}},
     {150,
+     {"info build", "The directory[ {file}] is not a package source that the engine can read.",
+      "See the reason given; 'corvpkg lint' on it names every finding with its fix.",
+      "Check the package's source."}},
+    {150,
      {nullptr, "The package[ {package}] is broken: its installation is incomplete or damaged.",
       "Repair it with 'corvpkg repair <file.cpk>' from its package file, or remove it with "
       "'corvpkg uninstall[ {package}]'.",
@@ -397,6 +401,12 @@ const KeyEntry kKeys[] = {
      {nullptr, "Updates are available for[ {1}] packages.", "Upgrade them when convenient.",
       nullptr}},
     {"pkgmgr:pkgmgr_upgrade_noti_link", 0, {nullptr, "Open the Package Center.", "", nullptr}},
+    // The programs' own: answers that the wizard does not ask for, and the keys it does.
+    {"corvpkg:unknown_answer_keys",
+     0,
+     {nullptr, "The answers name keys that the package's wizard does not ask for[: {1}].",
+      "Use the keys it asks for[: {2}]; 'corvpkg wizard <file.cpk>' shows the questions.",
+      "Answer the questions the wizard asks[: {2}]."}},
     {"tree:leaf_packagemanage", 0, {nullptr, "Package Center.", "", nullptr}},
 };
 

@@ -25,7 +25,8 @@ const Command& findCommand(const char* name) {
 
 bool parseCommon(const std::vector<std::string>& args, const Command& command, CommonOptions& out,
                  const std::vector<OptionSpec>& extra) {
-    std::vector<OptionSpec> specs = {{"--json", false}, {"--lang", true}};
+    std::vector<OptionSpec> specs = {{"--json", false}, {"--lang", true},     {"--quiet", false},
+                                     {"-q", false},     {"--verbose", false}, {"-v", false}};
     specs.insert(specs.end(), extra.begin(), extra.end());
     bool optionsEnded = false;
     for (size_t i = 0; i < args.size(); ++i) {
@@ -66,6 +67,11 @@ bool parseCommon(const std::vector<std::string>& args, const Command& command, C
         }
         if (name == "--json") {
             out.json = true;
+            verbosity().json = true;
+        } else if (name == "--quiet" || name == "-q") {
+            verbosity().quiet = true;
+        } else if (name == "--verbose" || name == "-v") {
+            verbosity().verbose = true;
         } else if (name == "--lang") {
             out.lang = value;
         } else {
@@ -114,29 +120,85 @@ void printNoSpace(const Json::Value& data) {
             space["free"].asString().c_str());
 }
 
+namespace {
+
+// The named values of a failure's data that its words can use.
+corvtext::Params textParams(const Json::Value& data) {
+    corvtext::Params params = failureContext();
+    if (!data.isObject()) {
+        return params;
+    }
+    for (const char* key : {"deppkg", "oldver", "curver", "services", "file", "holder"}) {
+        if (data[key].isString()) {
+            params[key] = data[key].asString();
+        }
+    }
+    // The dependents come as a JSON array in text; a person reads a list.
+    Json::Value names;
+    if (CORVPackageTool::fromString(params["deppkg"], names) && names.isArray()) {
+        std::string list;
+        for (const Json::Value& name : names) {
+            list += (list.empty() ? "" : ", ") + (name.isString() ? name.asString() : "?");
+        }
+        params["deppkg"] = list;
+    }
+    const Json::Value& inner = data["data"];
+    const Json::Value& space = data.isMember("no_space") ? data["no_space"]
+                               : inner.isObject()        ? inner["no_space"]
+                                                         : Json::Value::nullSingleton();
+    if (space.isObject()) {
+        params["volume"] = space["volume"].asString();
+        params["needed"] = inMiB(space["needed"]);
+        params["free"] = inMiB(space["free"]);
+    }
+    return params;
+}
+
+}  // namespace
+
 int printFailure(bool json, int code, const std::string& reason, const Json::Value& data) {
+    json = json || verbosity().json;
     const CORVPackageTool::PKG_ERRCODE_INFO* info = CORVPackageTool::PMSGetErrCodeInfo(code);
     const char* name = info ? info->name : "PKG_ERR_UNKNOWN";
     // The key the desktop would translate for this failure, so scripts can do the same.
     const char* key = info ? (info->installMsg ? info->installMsg : info->checkReport) : nullptr;
-    // Some failures log nothing of their own: the code's meaning still says what happened.
-    const std::string text = !reason.empty() || !info ? reason : info->meaning;
+    const corvtext::Params params = textParams(data);
+    // A refusal's report names the case more closely than its code (which dependency is
+    // missing, which port is taken).
+    const Json::Value& report = data.isObject() ? data["report"] : Json::Value::nullSingleton();
+    if (report.isArray() && !report.empty() && report[0].isString()) {
+        key = report[0].asCString();
+    }
+    const corvtext::Text text = report.isArray() && !report.empty()
+                                    ? corvtext::textForMessage(report, params)
+                                    : corvtext::textForCode(code, params);
     if (json) {
         Json::Value out(Json::objectValue);
         out["success"] = false;
         out["code"] = code;
         out["name"] = name;
-        out["reason"] = text;
+        out["message"] = text.sentence;
+        out["remedy"] = text.remedy;
+        out["reason"] = !reason.empty() || !info ? reason : info->meaning;
         if (key) {
             out["message_key"] = key;
         }
         if (!data.isNull()) {
             out["data"] = data;
         }
-        printf("%s\n", CORVPackageTool::toString(out).c_str());
-    } else {
-        fprintf(stderr, "error: %s (%d): %s\n", name, code, text.c_str());
-        printNoSpace(data);
+        printJson(out);
+        return EXIT_FAILED;
+    }
+    fprintf(stderr, "error: %s\n", text.sentence.c_str());
+    // The reason adds what the sentence does not say already.
+    if (!reason.empty() && text.sentence.find(reason) == std::string::npos) {
+        fprintf(stderr, "  %s\n", reason.c_str());
+    }
+    if (!text.remedy.empty()) {
+        fprintf(stderr, "hint: %s\n", text.remedy.c_str());
+    }
+    if (verbosity().verbose) {
+        fprintf(stderr, "result: %s (%d)\n", name, code);
         if (key) {
             fprintf(stderr, "message key: %s\n", key);
         }
@@ -147,14 +209,55 @@ int printFailure(bool json, int code, const std::string& reason, const Json::Val
     return EXIT_FAILED;
 }
 
+void printJson(const Json::Value& object) {
+    printf("%s\n", CORVPackageTool::toString(object).c_str());
+}
+
+Verbosity& verbosity() {
+    static Verbosity state;
+    return state;
+}
+
+corvtext::Params& failureContext() {
+    static corvtext::Params context;
+    return context;
+}
+
 bool isReadableFile(const std::string& path) {
     struct stat st {};
     return stat(path.c_str(), &st) == 0 && S_ISREG(st.st_mode) && access(path.c_str(), R_OK) == 0;
 }
 
-int usageError(const Command& command, const std::string& message) {
-    fprintf(stderr, "corvpkg %s: %s\n\n%s", command.name, message.c_str(), command.usage);
+namespace {
+
+int reportUsage(const std::string& message, const std::string& usage, const std::string& help) {
+    if (verbosity().json) {
+        Json::Value out(Json::objectValue);
+        out["success"] = false;
+        out["name"] = "USAGE";
+        out["message"] = message;
+        out["remedy"] = "see '" + help + "'";
+        out["usage"] = usage;
+        printJson(out);
+    } else {
+        fprintf(stderr, "corvpkg: %s\n%s\nsee '%s'\n", message.c_str(), usage.c_str(),
+                help.c_str());
+    }
     return EXIT_USAGE;
+}
+
+}  // namespace
+
+int usageError(const Command& command, const std::string& message) {
+    // The first usage line is enough to see the slip; the rest is one --help away.
+    const std::string usage = command.usage;
+    return reportUsage(std::string(command.name) + ": " + message,
+                       usage.substr(0, usage.find('\n')),
+                       std::string("corvpkg ") + command.name + " --help");
+}
+
+int programUsageError(const std::string& message) {
+    return reportUsage(message, "usage: corvpkg <command> [options]", "corvpkg --help");
 }
 
 LogCapture::LogCapture() {

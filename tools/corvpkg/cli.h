@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "corvpkg/packagemanager.h"
+#include "message_text.h"
 
 namespace cli {
 
@@ -36,6 +37,17 @@ struct OptionSpec {
     bool takesValue;
 };
 
+// How much this run prints, from -q/--quiet, -v/--verbose and --json. main sets `json` before
+// the command runs, so that even a usage error comes as JSON; parseCommon sets the rest.
+struct Verbosity {
+    bool json = false;
+    bool verbose = false;  // the command trace, result codes and message keys too
+    bool quiet = false;    // only the outcome
+};
+Verbosity& verbosity();
+// What a failure's words may name: "operation" (the command) and, once known, "package".
+corvtext::Params& failureContext();
+
 // What parseCommon took out of the arguments.
 struct CommonOptions {
     bool json = false;
@@ -44,8 +56,8 @@ struct CommonOptions {
     std::map<std::string, std::string> options;  // the command's own; "" for a flag
     bool has(const char* name) const { return options.count(name) != 0; }
 };
-// --json and --lang for every command, plus `extra`. False (after printing why) when an
-// option is unknown or lacks its value.
+// --json, --lang, -q/--quiet and -v/--verbose for every command, plus `extra`. False (after
+// printing why) when an option is unknown or lacks its value.
 bool parseCommon(const std::vector<std::string>& args, const Command& command, CommonOptions& out,
                  const std::vector<OptionSpec>& extra = {});
 
@@ -54,15 +66,24 @@ bool parseCommon(const std::vector<std::string>& args, const Command& command, C
 int parseSingle(const std::vector<std::string>& args, const char* command, const char* what,
                 CommonOptions& out, const std::vector<OptionSpec>& extra = {});
 
-// Prints a failure as "error: <CODE_NAME> (<code>): <reason>", or with --json as
-// {"success":false,"code":N,"name":"...","reason":"...","data":...}. Returns EXIT_FAILED.
+// Prints a failure in words: "error: <sentence>", the reason, and "hint: <remedy>" (with
+// --verbose also the code's name, the message key and the data), or with --json as
+// {"success":false,"code":N,"name":"...","message":"...","remedy":"...","reason":"...",
+//  "message_key":"...","data":...}. A "report" array in `data` (an installability refusal)
+// chooses the words. Returns EXIT_FAILED.
 int printFailure(bool json, int code, const std::string& reason,
                  const Json::Value& data = Json::Value());
 // When `data` (or its member "data") holds "no_space" ({"volume", "needed", "free"}),
 // says on standard error that the volume is full, with both sizes.
 void printNoSpace(const Json::Value& data);
-// The usage error path: message and the command's usage on standard error.
+// The usage error path: the message, the command's first usage line and where its help is,
+// on standard error; with --json one object {"success":false,"name":"USAGE", ...} on standard
+// output. Returns EXIT_USAGE.
 int usageError(const Command& command, const std::string& message);
+// The same for the program as a whole (no command, or an unknown one).
+int programUsageError(const std::string& message);
+// Prints a JSON object on standard output, on one line.
+void printJson(const Json::Value& object);
 
 // A regular file that this process may read.
 bool isReadableFile(const std::string& path);

@@ -50,8 +50,16 @@ std::string joined(const std::vector<std::string>& items, const char* separator)
 
 }  // namespace
 
-int cmdVersionCompare(const std::vector<std::string>& args) {
+int cmdVersionCompare(const std::vector<std::string>& given) {
     const Command& self = findCommand("version-compare");
+    // Versions and operators never begin with "--": the common options may stand anywhere.
+    std::vector<std::string> args;
+    for (const std::string& arg : given) {
+        if (arg != "--json" && arg != "--quiet" && arg != "-q" && arg != "--verbose" &&
+            arg != "-v") {
+            args.push_back(arg);
+        }
+    }
     if (args.size() != 3) {
         return usageError(self, "give a version, an operator and a version");
     }
@@ -63,11 +71,9 @@ int cmdVersionCompare(const std::vector<std::string>& args) {
     // The comparison reads any text, a word as 0: "abc" < "1.0" would hold.
     for (const std::string& version : {args[0], args[2]}) {
         if (!PMSIsVersionText(version)) {
-            fprintf(stderr,
-                    "corvpkg version-compare: \"%s\" is not a version (dotted numbers with an "
-                    "optional -build, e.g. 1.2.3-0045)\n",
-                    version.c_str());
-            return EXIT_USAGE;
+            return usageError(self, "\"" + version +
+                                        "\" is not a version (dotted numbers with an optional "
+                                        "-build, e.g. 1.2.3-0045)");
         }
     }
     // The relation of the first version to the second.

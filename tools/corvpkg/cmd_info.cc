@@ -78,6 +78,7 @@ int cmdInfo(const std::vector<std::string>& args) {
         return status;
     }
     const std::string& dir = opts.positional[0];
+    failureContext()["file"] = dir;
     struct stat st {};
     if (stat(dir.c_str(), &st) != 0 || !S_ISDIR(st.st_mode)) {
         return printFailure(opts.json, PKG_ERR_BROKEN, dir + " is not a directory");

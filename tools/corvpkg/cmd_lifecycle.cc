@@ -7,6 +7,7 @@
 #include "cli.h"
 #include "corvpkg/corvpkg.h"
 #include "corvpkg/pkgvolume.h"
+#include "progress.h"
 
 namespace cli {
 
@@ -17,6 +18,25 @@ namespace {
 const char* optionalText(const CommonOptions& opts, const char* name) {
     auto it = opts.options.find(name);
     return it == opts.options.end() ? nullptr : it->second.c_str();
+}
+
+// The resource workers' messages ([{"sec", "key", "params"}]) in words, one line each.
+void printWorkerMessages(const Json::Value& messages) {
+    if (!messages.isArray()) {
+        return;
+    }
+    for (const Json::Value& message : messages) {
+        if (!message.isObject() || !message["key"].isString()) {
+            continue;
+        }
+        Json::Value array(Json::arrayValue);
+        array.append(message["sec"].asString() + ":" + message["key"].asString());
+        for (const Json::Value& param : message["params"]) {
+            array.append(param.isString() ? param.asString() : toString(param));
+        }
+        fprintf(stderr, "  %s\n",
+                corvtext::oneLine(corvtext::textForMessage(array, failureContext())).c_str());
+    }
 }
 
 }  // namespace
@@ -43,8 +63,12 @@ int printOperationOutcome(const CommonOptions& opts, PackageManager& pm, int out
         }
     }
     if (outcome == 0) {
-        return printFailure(opts.json, pm.getResult(), log.reasons(),
-                            data.empty() ? Json::Value() : data);
+        const int status = printFailure(opts.json, pm.getResult(), log.reasons(),
+                                        data.empty() ? Json::Value() : data);
+        if (!opts.json) {
+            printWorkerMessages(data["worker_msg"]);
+        }
+        return status;
     }
     if (opts.json) {
         Json::Value out(Json::objectValue);
@@ -57,9 +81,7 @@ int printOperationOutcome(const CommonOptions& opts, PackageManager& pm, int out
         printf("%s\n", toString(out).c_str());
     } else {
         printf("%s %s\n", done, name.c_str());
-        if (data.isMember("worker_msg")) {
-            printf("worker_msg: %s\n", toString(data["worker_msg"]).c_str());
-        }
+        printWorkerMessages(data["worker_msg"]);
     }
     return EXIT_OK;
 }
@@ -73,6 +95,7 @@ int startStop(const std::vector<std::string>& args, const char* command, bool st
         return status;
     }
     const std::string& name = opts.positional[0];
+    failureContext()["package"] = name;
     PackageManager pm;
     LogCapture log;
     // Without this a name that is not installed has no dependency order and counts as done.
@@ -91,6 +114,8 @@ int startStop(const std::vector<std::string>& args, const char* command, bool st
         }
     }
     int outcome = 0;
+    ProgressDisplay display(command);
+    display.follow(name);
     if (restart) {
         outcome = pm.serviceControlRestart(name);
     } else {
@@ -98,6 +123,7 @@ int startStop(const std::vector<std::string>& args, const char* command, bool st
             pm.serviceControl(static_cast<PKG_INSTALLATION_TYPE>(start ? 8 : 0x10), name, start,
                               language, optionalText(opts, "--user"), nullptr, true, true);
     }
+    display.finish();
     int status = printOperationOutcome(
         opts, pm, outcome, restart ? "restarted" : (start ? "started" : "stopped"), name, log);
     if (status == EXIT_OK && !opts.json && !dependents.empty()) {

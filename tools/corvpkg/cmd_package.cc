@@ -27,6 +27,14 @@ Json::Value scriptNames(unsigned int mask) {
     return names;
 }
 
+// The words of an installability refusal: its report, which names the case, or its code.
+corvtext::Text refusalText(int code, const Json::Value& report) {
+    corvtext::Params params = failureContext();
+    params["operation"] = "check";
+    return report.isArray() && !report.empty() ? corvtext::textForMessage(report, params)
+                                               : corvtext::textForCode(code, params);
+}
+
 }  // namespace
 
 int cmdBuild(const std::vector<std::string>& args) {
@@ -37,6 +45,7 @@ int cmdBuild(const std::vector<std::string>& args) {
         return status;
     }
     const std::string& source = opts.positional[0];
+    failureContext()["file"] = source;
     std::string output = opts.has("-o") ? opts.options["-o"] : "";
     if (output.empty()) {
         PackageInfo info;
@@ -78,6 +87,7 @@ int cmdInspect(const std::vector<std::string>& args) {
         return status;
     }
     const std::string& file = opts.positional[0];
+    failureContext()["file"] = file;
     if (!isReadableFile(file)) {
         return printFailure(opts.json, PKG_ERR_FILE_ACCESS, file + " is not a readable file");
     }
@@ -119,6 +129,7 @@ int cmdCheck(const std::vector<std::string>& args) {
         return status;
     }
     const std::string& file = opts.positional[0];
+    failureContext()["file"] = file;
     if (!isReadableFile(file)) {
         return printFailure(opts.json, PKG_ERR_FILE_ACCESS, file + " is not a readable file");
     }
@@ -141,6 +152,9 @@ int cmdCheck(const std::vector<std::string>& args) {
         out["report"] = report;
         if (!ok) {
             const PKG_ERRCODE_INFO* codeInfo = PMSGetErrCodeInfo(code);
+            const corvtext::Text text = refusalText(code, report);
+            out["message"] = text.sentence;
+            out["remedy"] = text.remedy;
             out["code"] = code;
             out["name"] = codeInfo ? codeInfo->name : "";
             out["data"] = data;
@@ -156,6 +170,8 @@ int cmdCheck(const std::vector<std::string>& args) {
                displayName.empty() ? file.c_str() : displayName.c_str(), text.c_str(),
                codeInfo ? codeInfo->name : "PKG_ERR_UNKNOWN");
         printNoSpace(data);
+        const corvtext::Text words = refusalText(code, report);
+        printf("  %s\n", corvtext::oneLine(words).c_str());
     }
     return ok ? EXIT_OK : EXIT_FAILED;
 }

@@ -25,8 +25,10 @@ const char kInstallUsage[] =
     "what is installed and installs it fresh, upgrades the installed version (the\n"
     "same version counts as an upgrade), or repairs a broken installation.\n"
     "First the installability checks run (architecture, OS version, dependencies,\n"
-    "conflicts, signature); a refusal prints the report. When the package has an\n"
-    "install wizard its questions are printed and must be answered.\n"
+    "conflicts, signature); a refusal says why and what to do. When the package has\n"
+    "an install wizard, its questions are asked one by one on a terminal (Enter takes\n"
+    "the default); elsewhere they must be answered with --answers or --defaults. An\n"
+    "answer whose key no question has is refused, with the keys there are.\n"
     "  --volume V           the volume for a fresh install (a saved default volume wins)\n"
     "  --no-start           leave the package stopped afterwards\n"
     "  --answers F.json     the wizard's answers, a JSON object of key: value\n"
@@ -35,8 +37,12 @@ const char kInstallUsage[] =
     "  --ignore-dependents  upgrade even when running packages depend on this one\n"
     "  --no-verify          install an unsigned or untrusted file\n"
     "  --user U             the user on whose behalf it runs\n"
-    "Progress goes to standard error; the outcome names the result code and the\n"
-    "message key, and prints what the scripts left in their message file.\n"
+    "  -q, --quiet          print only the outcome\n"
+    "  -v, --verbose        also every command and script it runs, and the result code\n"
+    "Progress goes to standard error, one line per phase (checking, unpacking, running\n"
+    "scripts, starting); on a terminal each line is redrawn in place, with the bytes\n"
+    "unpacked. A wait for the package lock says which process holds it. The outcome\n"
+    "prints what the scripts left in their message file.\n"
     "Exit status: 0 done, 1 failed or refused, 2 usage error (also: questions left\n"
     "unanswered).\n";
 
@@ -333,7 +339,10 @@ void printHelp() {
         "       corvpkg --version | --help  (also -V, -h)\n"
         "       corvpkg <command> --help\n\n"
         "The package engine of the NOS appliance. \"--\" ends a command's options: what\n"
-        "follows is taken as names and files, even when it begins with \"-\".\n\ncommands:\n");
+        "follows is taken as names and files, even when it begins with \"-\".\n"
+        "Every command takes --json (its outcome, a refusal or usage error too, as one JSON\n"
+        "object on standard output), -q/--quiet (only the outcome) and -v/--verbose (the\n"
+        "command trace, result codes and message keys).\n\ncommands:\n");
     int width = 0;
     for (const cli::Command& command : cli::commands()) {
         width = std::max(width, static_cast<int>(strlen(command.name)));
@@ -347,9 +356,25 @@ void printHelp() {
 
 int main(int argc, char** argv) {
     std::vector<std::string> args(argv + 1, argv + argc);
+    // Known before any parsing, so that every outcome, a usage error too, is one JSON object.
+    for (const std::string& arg : args) {
+        if (arg == "--") {
+            break;
+        }
+        if (arg == "--json") {
+            cli::verbosity().json = true;
+        }
+    }
+    // The common options may also come before the command.
+    while (!args.empty() && (args[0] == "--json" || args[0] == "-q" || args[0] == "--quiet" ||
+                             args[0] == "-v" || args[0] == "--verbose")) {
+        cli::verbosity().quiet = cli::verbosity().quiet || args[0] == "-q" || args[0] == "--quiet";
+        cli::verbosity().verbose =
+            cli::verbosity().verbose || args[0] == "-v" || args[0] == "--verbose";
+        args.erase(args.begin());
+    }
     if (args.empty()) {
-        printHelp();
-        return cli::EXIT_USAGE;
+        return cli::programUsageError("no command given");
     }
     if (args[0] == "--help" || args[0] == "-h" || args[0] == "help") {
         printHelp();
@@ -375,8 +400,8 @@ int main(int argc, char** argv) {
                 return cli::EXIT_OK;
             }
         }
+        cli::failureContext()["operation"] = command.name;
         return command.run(rest);
     }
-    fprintf(stderr, "corvpkg: unknown command '%s'; see corvpkg --help\n", args[0].c_str());
-    return cli::EXIT_USAGE;
+    return cli::programUsageError("unknown command '" + args[0] + "'");
 }

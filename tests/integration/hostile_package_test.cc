@@ -207,8 +207,8 @@ TEST(HostilePackage, PayloadArchiveThatIsNoRegularFileIsABadPackage) {
     alarm(90);
     const std::string file = testutil::buildPackage(testutil::recordingPackage("demo"));
     replaceMember(file, "package.tgz", namedPipe);
-    const std::vector<std::vector<std::string>> commands = {{"check", file},
-                                                            {"install", file, "--no-verify"}};
+    const std::vector<std::vector<std::string>> commands = {{"check", file, "-v"},
+                                                            {"install", file, "--no-verify", "-v"}};
     for (const auto& args : commands) {
         testutil::RunResult r = testutil::run(CORVPKG_CLI_PATH, args);
         EXPECT_EQ(r.status, 1) << args[0] << ": " << r.out << r.err;

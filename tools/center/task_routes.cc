@@ -3,8 +3,10 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <fstream>
 #include <memory>
+#include <thread>
 
 #include "corv/task.h"
 #include "corvpkg/pkglog.h"
@@ -44,7 +46,7 @@ void dropDownloadRecords(const Json::Value& plan, pid_t pid) {
             NOS::TaskMgr tasks(PKG_TASK_OWNER);
             std::unique_ptr<NOS::Task> task(
                 tasks.getTask(PKG_DOWNLOAD_TASK_PREFIX + entry["package"].asString()));
-            if (task && pid > 0 && task->getProperty("pid").asInt64() == pid) {
+            if (task && pid > 0 && task->getProperty("data")["pid"].asInt64() == pid) {
                 task->remove();
             }
         } catch (const std::exception&) {
@@ -247,6 +249,14 @@ void addTaskRoutes(httplib::Server& server, Center& center) {
                         return;
                     }
                     dropDownloadRecords(plan, worker);
+                    // A worker told to stop just before it wrote its download record would
+                    // still fetch the whole file: its record is taken away until it is gone.
+                    std::thread([&center, id, plan, worker] {
+                        for (int i = 0; i < 600 && center.tasks.busy(id); ++i) {
+                            std::this_thread::sleep_for(std::chrono::milliseconds(100));
+                            dropDownloadRecords(plan, worker);
+                        }
+                    }).detach();
                     sendTask(center, id, response);
                 });
 }

@@ -10,6 +10,7 @@
 #include <algorithm>
 
 #include "corv/log.h"
+#include "corv/vlibc.h"
 #include "corvpkg/corvpkg.h"
 
 namespace cli {
@@ -21,6 +22,17 @@ const Command& findCommand(const char* name) {
         }
     }
     abort();  // only called with the names of the table
+}
+
+std::string languageOf(const CommonOptions& opts) {
+    if (!opts.lang.empty()) {
+        return opts.lang;
+    }
+    char value[256] = {0};
+    if (VLIBCFileGetKeyValue(VLIBC_INFO_PATH, "language", value, sizeof value, 0) > 0) {
+        return value;
+    }
+    return "enu";
 }
 
 bool parseCommon(const std::vector<std::string>& args, const Command& command, CommonOptions& out,

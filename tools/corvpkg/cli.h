@@ -58,6 +58,9 @@ struct CommonOptions {
 };
 // --json, --lang, -q/--quiet and -v/--verbose for every command, plus `extra`. False (after
 // printing why) when an option is unknown or lacks its value.
+// The language of `opts`, else the system's ("language" in the system's settings), else "enu".
+std::string languageOf(const CommonOptions& opts);
+
 bool parseCommon(const std::vector<std::string>& args, const Command& command, CommonOptions& out,
                  const std::vector<OptionSpec>& extra = {});
 

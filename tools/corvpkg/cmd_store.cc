@@ -17,17 +17,6 @@ using namespace CORVPackageTool;
 
 namespace {
 
-std::string languageOf(const CommonOptions& opts) {
-    if (!opts.lang.empty()) {
-        return opts.lang;
-    }
-    char value[256] = {0};
-    if (VLIBCFileGetKeyValue(VLIBC_INFO_PATH, "language", value, sizeof value, 0) > 0) {
-        return value;
-    }
-    return "enu";
-}
-
 std::string text(const Json::Value& entry, const char* key) {
     const Json::Value* value = entry.isObject() ? entry.find(key, key + strlen(key)) : nullptr;
     return value != nullptr && (value->isString() || value->isNumeric()) ? value->asString() : "";

@@ -32,17 +32,6 @@ const std::vector<OptionSpec> kInstallOptions = {{"--volume", true},
                                                  {"--user", true},
                                                  {"--all", false}};
 
-std::string languageOf(const CommonOptions& opts) {
-    if (!opts.lang.empty()) {
-        return opts.lang;
-    }
-    char value[256] = {0};
-    if (VLIBCFileGetKeyValue(VLIBC_INFO_PATH, "language", value, sizeof value, 0) > 0) {
-        return value;
-    }
-    return "enu";
-}
-
 // A name, not a file: nothing of that name here, no "/" and no ".cpk" at its end.
 bool namesStorePackage(const std::string& arg) {
     struct stat st {};

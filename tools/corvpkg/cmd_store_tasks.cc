@@ -27,10 +27,6 @@ using namespace CORVPackageTool;
 
 namespace {
 
-std::string languageOf(const CommonOptions& opts) {
-    return opts.lang.empty() ? "enu" : opts.lang;
-}
-
 std::string text(const Json::Value& value, const char* key) {
     const Json::Value& member = value.isObject() ? value[key] : Json::Value::nullSingleton();
     return member.isString() || member.isNumeric() || member.isBool() ? member.asString() : "";

@@ -155,7 +155,6 @@ int cmdCancel(const std::vector<std::string>& args);
 int cmdUpdates(const std::vector<std::string>& args);
 int cmdChkUpgradePkg(const std::vector<std::string>& args);
 int cmdIcon(const std::vector<std::string>& args);
-extern const char kStoreInstallUsage[];
 extern const char kStoreTaskUsage[];
 int cmdStartAll(const std::vector<std::string>& args);
 int cmdStopAll(const std::vector<std::string>& args);

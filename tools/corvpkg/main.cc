@@ -16,10 +16,11 @@ namespace {
 
 // install, upgrade and repair are one command under three names.
 const char kInstallUsage[] =
-    "usage: corvpkg install|upgrade|repair <file.cpk>\n"
+    "usage: corvpkg install|upgrade|repair <file.cpk | name>\n"
     "               [--volume V] [--no-start] [--answers F.json]\n"
     "               [--defaults] [--lang L] [--ignore-dependents] [--no-verify]\n"
     "               [--user U] [--json]\n"
+    "       corvpkg upgrade --all [--defaults] [--json]\n"
     "\n"
     "install, upgrade and repair are one entrance: the engine compares the file with\n"
     "what is installed and installs it fresh, upgrades the installed version (the\n"
@@ -29,6 +30,13 @@ const char kInstallUsage[] =
     "an install wizard, its questions are asked one by one on a terminal (Enter takes\n"
     "the default); elsewhere they must be answered with --answers or --defaults. An\n"
     "answer whose key no question has is refused, with the keys there are.\n"
+    "A name that is no file here is a store's package: the maker store's order of it\n"
+    "and what it depends on (or the feed's package alone) is downloaded, each with a\n"
+    "progress bar on a terminal and its checksum checked, and each package that is\n"
+    "missing or older is installed in that order as a file would be. A package that\n"
+    "asks questions needs --answers (the named package only) or --defaults before\n"
+    "anything is installed. upgrade --all does this for every update that \"corvpkg\n"
+    "updates\" lists.\n"
     "  --volume V           the volume for a fresh install (a saved default volume wins)\n"
     "  --no-start           leave the package stopped afterwards\n"
     "  --answers F.json     the wizard's answers, a JSON object of key: value\n"
@@ -226,9 +234,9 @@ const std::vector<Command>& commands() {
          cmdServiceDown},
         {"wizard", "show a package's wizard steps or defaults", kWizardUsage, cmdWizard},
         {"install", "install a package file or a store's package (or upgrade or repair)",
-         kStoreInstallUsage, cmdInstallAny},
+         kInstallUsage, cmdInstallAny},
         {"upgrade", "the same as install; upgrade --all takes every update the stores offer",
-         kStoreInstallUsage, cmdUpgradeAny},
+         kInstallUsage, cmdUpgradeAny},
         {"repair", "the same as install: repair a broken package from its file", kInstallUsage,
          cmdRepair},
         {"uninstall", "uninstall a package",

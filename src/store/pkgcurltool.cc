@@ -20,6 +20,20 @@
 
 namespace CORVPackageTool {
 
+CURLcode PMSRetryWithFallbackDns(CURL* curl, CURLcode first) {
+    if (first != CURLE_COULDNT_RESOLVE_HOST) {
+        return first;
+    }
+    CORV_LOG_ERR("Fallback dns to %s", PKG_CURL_FALLBACK_DNS);
+    CURLcode set = curl_easy_setopt(curl, CURLOPT_DNS_SERVERS, PKG_CURL_FALLBACK_DNS);
+    if (set != CURLE_OK) {
+        CORV_LOG_ERR("Failed to set CURLOPT_DNS_SERVERS, return value=%d, err=%s", set,
+                     curl_easy_strerror(set));
+        return first;
+    }
+    return curl_easy_perform(curl);
+}
+
 namespace {
 
 int g_transportResult = 0;
@@ -140,17 +154,7 @@ CURLcode performWithDnsFallback(CURL* curl) {
     if (code != CURLE_OK) {
         CORV_LOG_ERR("Failed to curl perform, code=%d, err=%s", code, curl_easy_strerror(code));
     }
-    if (code != CURLE_COULDNT_RESOLVE_HOST) {
-        return code;
-    }
-    CORV_LOG_ERR("Fallback dns to %s", PKG_CURL_FALLBACK_DNS);
-    CURLcode set = curl_easy_setopt(curl, CURLOPT_DNS_SERVERS, PKG_CURL_FALLBACK_DNS);
-    if (set != CURLE_OK) {
-        CORV_LOG_ERR("Failed to set CURLOPT_DNS_SERVERS, return value=%d, err=%s", set,
-                     curl_easy_strerror(set));
-        return code;
-    }
-    return curl_easy_perform(curl);
+    return PMSRetryWithFallbackDns(curl, code);
 }
 
 bool setTlsOptions(CURL* curl) {

@@ -198,18 +198,7 @@ bool setTransferOptions(CURL* curl, Transfer& t) {
 
 // One attempt, with the fallback name server after a name that can't be resolved.
 CURLcode performOnce(CURL* curl) {
-    CURLcode rc = curl_easy_perform(curl);
-    if (rc != CURLE_COULDNT_RESOLVE_HOST) {
-        return rc;
-    }
-    CORV_LOG_ERR("Fallback dns to %s", PKG_CURL_FALLBACK_DNS);
-    CURLcode set = curl_easy_setopt(curl, CURLOPT_DNS_SERVERS, PKG_CURL_FALLBACK_DNS);
-    if (set != CURLE_OK) {
-        CORV_LOG_ERR("Failed to set CURLOPT_DNS_SERVERS, return value=%d, err=%s", set,
-                     curl_easy_strerror(set));
-        return rc;
-    }
-    return curl_easy_perform(curl);
+    return PMSRetryWithFallbackDns(curl, curl_easy_perform(curl));
 }
 
 // Up to 4 attempts; a retried attempt starts the file and the digest again from zero.

@@ -1,6 +1,7 @@
 // Internals of the store client's lists, reachable by the unit tests.
 #pragma once
 
+#include <curl/curl.h>
 #include <json/json.h>
 #include <sys/stat.h>
 
@@ -9,6 +10,10 @@
 #include <unordered_set>
 
 namespace CORVPackageTool {
+
+// After a perform that ended with `first`: an unresolvable host is tried once more with
+// the fallback name server (kept on the handle); any other result is returned as it is.
+CURLcode PMSRetryWithFallbackDns(CURL* curl, CURLcode first);
 
 // Records the words that PMSGetLastStoreFailure gives, for a reply that arrived but is
 // no good.

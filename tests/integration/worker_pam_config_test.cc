@@ -2,7 +2,9 @@
 // service, with the platform's own modules that the generated file names.
 #include <gtest/gtest.h>
 
+#include <chrono>
 #include <string>
+#include <thread>
 
 #include "corv/app_priv.h"
 #include "corv/service.h"
@@ -109,7 +111,13 @@ TEST_F(PamConfigWorker, AnAutoblockedUserIsRefusedEvenWithTheRightPassword) {
     EXPECT_EQ(Pamtester("demo-login", "bob", "secret-bob"), 0);
 
     if (testutil::exists("/usr/sbin/syslog-ng")) {
-        const std::string auth = testutil::readFile("/var/log/auth.log");
+        // syslog-ng writes asynchronously: wait for bob's line, the last one sent.
+        std::string auth;
+        for (int i = 0; i < 100; ++i) {
+            auth = testutil::readFile("/var/log/auth.log");
+            if (auth.find("User [bob]") != std::string::npos) break;
+            std::this_thread::sleep_for(std::chrono::milliseconds(50));
+        }
         EXPECT_NE(auth.find("User [alice] from [localhost] failed to sign in to [demo]"),
                   std::string::npos)
             << auth;

@@ -148,6 +148,13 @@ TEST(CliOutput, PhasesThroughAPipeQuietAndVerbose) {
     EXPECT_EQ(r.out, "uninstalled demo\n");
     EXPECT_EQ(r.err, "");
 
+    // A fresh install left stopped is a plain success, with no warning after it.
+    r = corvpkg({"install", file, "--no-verify", "--no-start"});
+    ASSERT_EQ(r.status, 0) << r.err;
+    EXPECT_EQ(r.err.find("warning"), std::string::npos) << r.err;
+    EXPECT_EQ(r.err.find("starting"), std::string::npos) << r.err;
+    ASSERT_EQ(corvpkg({"uninstall", "demo", "-q"}).status, 0);
+
     r = corvpkg({"install", file, "--no-verify", "--verbose"});
     ASSERT_EQ(r.status, 0) << r.err;
     EXPECT_NE(r.err.find(" Begin "), std::string::npos) << r.err;

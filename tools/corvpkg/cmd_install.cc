@@ -222,9 +222,12 @@ int installCommand(const std::vector<std::string>& args, const char* command) {
     if (!message.empty() && !opts.json) {
         fprintf(stderr, "message from the package: %s\n", message.c_str());
     }
-    if (outcome == 1 && pm.getResult() != PKG_OK && !opts.json) {
+    // A fresh install that is not started keeps the "not installed" of the status check
+    // it began with: that is no news about the package now installed.
+    const PKG_ERRCODE after = pm.getResult();
+    if (outcome == 1 && after != PKG_OK && after != PKG_ERR_NOT_INSTALLED && !opts.json) {
         fprintf(stderr, "warning: installed, but then: %s\n",
-                corvtext::oneLine(corvtext::textForCode(pm.getResult(), failureContext())).c_str());
+                corvtext::oneLine(corvtext::textForCode(after, failureContext())).c_str());
     }
     return printOperationOutcome(opts, pm, outcome, wasInstalled ? "upgraded" : "installed",
                                  info.package, log);

@@ -133,7 +133,7 @@ int completeAnswers(const CommonOptions& opts, const Command& self, const Packag
 
 int installCommand(const std::vector<std::string>& args, const char* command) {
     CommonOptions opts;
-    if (int status = parseSingle(args, command, "package file", opts,
+    if (int status = parseSingle(args, command, "package file or name", opts,
                                  {{"--volume", true},
                                   {"--no-start", false},
                                   {"--answers", true},

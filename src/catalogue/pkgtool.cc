@@ -122,65 +122,42 @@ std::vector<std::string> PMSExplodeString(const std::string& text, const std::st
     return pieces;
 }
 
-bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* language,
-                        unsigned long long mask) {
-    // Paths, and a fresh record.
-    const std::string infoPath = dir + "/INFO";
-    const std::string depsPath = dir + "/conf/PKG_DEPS";
-    const std::string conxPath = dir + "/conf/PKG_CONX";
-    info = PackageInfo();
-    PackageInfoExtraPrivate* extra = info.extra.priv();
+namespace {
 
-    // Not a package directory: quietly no. An INFO that is no regular file (a named
-    // pipe would stall the read) is no INFO.
-    if (!VLIBCFileCheckDir(dir.c_str()) || !PMSIsRegularFile(infoPath)) {
-        return false;
-    }
-
-    // The keys to fetch and the values fetched.
-    InfoKeys keys;
-    if (!keys.ok()) {
-        CORV_LOG_ERR("Out of memory!!");
-        return false;
-    }
-
-    // Every key that is always read or that the mask selects.
+// Asks for every key that is always read or that the mask selects, and for the language
+// variants of the texts when texts for display are wanted. Returns the language read.
+std::string wantKeys(InfoKeys& keys, const char* language, unsigned long long mask) {
     for (const auto& [number, key] : g_MappingPKGInfoFields) {
         auto optional = g_MappingPKGInfoAdditional.find(number);
         if (optional == g_MappingPKGInfoAdditional.end() || (mask & optional->second) != 0) {
             keys.want(key.c_str());
         }
     }
-
-    // Language variants, only when texts for display are wanted.
-    std::string lang;
-    if ((mask & (INFO_MASK_DESCRIPTION | INFO_MASK_DISPLAYNAME)) != 0) {
-        lang = readLanguage(language);
-        if (lang.empty()) {
-            if (mask & INFO_MASK_DESCRIPTION) {
-                keys.want("description_enu");
-            }
-        } else {
-            if (mask & INFO_MASK_DISPLAYNAME) {
-                keys.want(langKey("displayname", lang).c_str());
-            }
-            if (mask & INFO_MASK_DESCRIPTION) {
-                keys.want(langKey("description", lang).c_str());
-                if (language == nullptr || strcasecmp(language, "enu") != 0) {
-                    keys.want("description_enu");
-                }
-            }
+    if ((mask & (INFO_MASK_DESCRIPTION | INFO_MASK_DISPLAYNAME)) == 0) {
+        return "";
+    }
+    const std::string lang = readLanguage(language);
+    if (lang.empty()) {
+        if (mask & INFO_MASK_DESCRIPTION) {
+            keys.want("description_enu");
+        }
+        return lang;
+    }
+    if (mask & INFO_MASK_DISPLAYNAME) {
+        keys.want(langKey("displayname", lang).c_str());
+    }
+    if (mask & INFO_MASK_DESCRIPTION) {
+        keys.want(langKey("description", lang).c_str());
+        if (language == nullptr || strcasecmp(language, "enu") != 0) {
+            keys.want("description_enu");
         }
     }
+    return lang;
+}
 
-    // One read of the file.
-    if (keys.load(infoPath.c_str()) < 0) {
-        CORV_LOG_ERR("VLIBCFileGetKeys() failed!! szFile=[%s], corverr=[0x%04X]", infoPath.c_str(),
-                     VLIBCErrGet());
-        return false;
-    }
-
-    // The name.
+// Name, version, maintainer and distributor: the keys without which there is no package.
+bool readIdentity(const InfoKeys& keys, const std::string& infoPath, unsigned long long mask,
+                  PackageInfo& info) {
     const char* value = keys.get(PKG_INFO_PACKAGE);
     if (value == nullptr) {
         CORV_LOG_ERR("key [%s] not found in %s corverr=[0x%04X]", "package", infoPath.c_str(),
@@ -193,7 +170,6 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
     }
     info.package = value;
 
-    // The version.
     value = keys.get(PKG_INFO_VERSION);
     if (isEmpty(value)) {
         CORV_LOG_ERR("key [%s] not found", "version");
@@ -201,7 +177,6 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
     }
     info.version = value;
 
-    // Maintainer and distributor.
     if (mask & INFO_MASK_MAINTAINER) {
         value = keys.get(PKG_INFO_MAINTAINER);
         if (isEmpty(value)) {
@@ -222,8 +197,13 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         value = keys.get(PKG_INFO_DISTRIBUTOR_URL);
         info.distributor_url = value ? value : "";
     }
+    return true;
+}
 
-    // The description.
+// The description and display name, in the wanted language where the file has one.
+bool readTexts(const InfoKeys& keys, const std::string& lang, unsigned long long mask,
+               PackageInfo& info) {
+    const char* value;
     if (mask & INFO_MASK_DESCRIPTION) {
         value = keys.get(PKG_INFO_DESCRIPTION);
         if (isEmpty(value)) {
@@ -236,61 +216,6 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
             info.description_enu = value;
         }
     }
-
-    // The web entry of the package. The port check lets 65536 through on purpose.
-    if (mask & INFO_MASK_ADMIN) {
-        value = keys.get(PKG_INFO_ADMINURL);
-        if (value != nullptr) {
-            info.adminurl = value;
-        }
-        value = keys.get(PKG_INFO_ADMINPORT);
-        if (value != nullptr) {
-            long port = strtol(value, nullptr, 10);
-            info.adminport = static_cast<int>(port);
-            if (static_cast<unsigned long>(port) > 65536UL) {
-                CORV_LOG_ERR("key [%s] %d is illegal", "adminport", info.adminport);
-                return false;
-            }
-        }
-        value = keys.get(PKG_INFO_ADMINPROTOCOL);
-        if (isEmpty(value)) {
-            info.adminprotocol.push_back("http");
-        } else {
-            info.adminprotocol = PMSExplodeString(value, " \t");
-        }
-    }
-
-    // Architectures and models.
-    value = keys.get(PKG_INFO_ARCH);
-    if (isEmpty(value)) {
-        info.arch = 0xFFFFFFFF;
-    } else {
-        info.arch = archMask(value, info.arch_list);
-    }
-    value = keys.get(PKG_INFO_EXCLUDE_ARCH);
-    if (value != nullptr) {
-        info.exclude_arch = archMask(value, info.exclude_arch_list);
-    }
-    value = keys.get(PKG_INFO_MODEL);
-    if (value != nullptr) {
-        info.model_list = PMSExplodeString(value, " \t");
-    }
-
-    // OS versions: "os_min_ver" is the newer name of "firmware" and wins over it.
-    value = keys.get(PKG_INFO_OS_MIN_VER);
-    if (value == nullptr) {
-        value = keys.get(PKG_INFO_FIRMWARE);
-    }
-    if (value != nullptr) {
-        PMSParseOSVersion(value, extra->os_min_ver);
-        PMSParseOSVersion(value, info.firmware);
-    }
-    value = keys.get(PKG_INFO_OS_MAX_VER);
-    if (value != nullptr) {
-        PMSParseOSVersion(value, extra->os_max_ver);
-    }
-
-    // Texts in the wanted language.
     if (mask & INFO_MASK_DISPLAYNAME) {
         value = keys.get(PKG_INFO_DISPLAYNAME);
         info.displayname = value ? value : "";
@@ -307,18 +232,67 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
             info.description = value;
         }
     }
+    return true;
+}
 
-    if (isNo(keys.get(PKG_INFO_CHECKPORT))) {
-        info.checkport = false;
+// The web entry of the package. The port check lets 65536 through on purpose.
+bool readAdmin(const InfoKeys& keys, unsigned long long mask, PackageInfo& info) {
+    if ((mask & INFO_MASK_ADMIN) == 0) {
+        return true;
     }
-    if (mask & INFO_MASK_HELPURL) {
-        value = keys.get(PKG_INFO_HELPURL);
-        if (value != nullptr) {
-            info.helpurl = value;
+    const char* value = keys.get(PKG_INFO_ADMINURL);
+    if (value != nullptr) {
+        info.adminurl = value;
+    }
+    value = keys.get(PKG_INFO_ADMINPORT);
+    if (value != nullptr) {
+        long port = strtol(value, nullptr, 10);
+        info.adminport = static_cast<int>(port);
+        if (static_cast<unsigned long>(port) > 65536UL) {
+            CORV_LOG_ERR("key [%s] %d is illegal", "adminport", info.adminport);
+            return false;
         }
     }
+    value = keys.get(PKG_INFO_ADMINPROTOCOL);
+    if (isEmpty(value)) {
+        info.adminprotocol.push_back("http");
+    } else {
+        info.adminprotocol = PMSExplodeString(value, " \t");
+    }
+    return true;
+}
 
-    // Daemons to restart and services required.
+// Architectures, models and OS versions: "os_min_ver" is the newer name of "firmware"
+// and wins over it.
+void readPlatforms(const InfoKeys& keys, PackageInfo& info) {
+    PackageInfoExtraPrivate* extra = info.extra.priv();
+    const char* value = keys.get(PKG_INFO_ARCH);
+    info.arch = isEmpty(value) ? 0xFFFFFFFF : archMask(value, info.arch_list);
+    value = keys.get(PKG_INFO_EXCLUDE_ARCH);
+    if (value != nullptr) {
+        info.exclude_arch = archMask(value, info.exclude_arch_list);
+    }
+    value = keys.get(PKG_INFO_MODEL);
+    if (value != nullptr) {
+        info.model_list = PMSExplodeString(value, " \t");
+    }
+    value = keys.get(PKG_INFO_OS_MIN_VER);
+    if (value == nullptr) {
+        value = keys.get(PKG_INFO_FIRMWARE);
+    }
+    if (value != nullptr) {
+        PMSParseOSVersion(value, extra->os_min_ver);
+        PMSParseOSVersion(value, info.firmware);
+    }
+    value = keys.get(PKG_INFO_OS_MAX_VER);
+    if (value != nullptr) {
+        PMSParseOSVersion(value, extra->os_max_ver);
+    }
+}
+
+// Daemons to restart and services required.
+void readServices(const InfoKeys& keys, unsigned long long mask, PackageInfo& info) {
+    PackageInfoExtraPrivate* extra = info.extra.priv();
     if (mask & INFO_MASK_RESTART_SERVICES) {
         info.instuninst_restart_services = static_cast<unsigned int>(
             PMSConvMapRestartService(keys.get(PKG_INFO_INSTUNINST_RESTART_SERVICES)));
@@ -326,17 +300,30 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
             PMSConvMapRestartService(keys.get(PKG_INFO_STARTSTOP_RESTART_SERVICES)));
     }
     if (mask & INFO_MASK_INSTALL_DEP_SERVICES) {
-        value = keys.get(PKG_INFO_INSTALL_DEP_SERVICES);
+        const char* value = keys.get(PKG_INFO_INSTALL_DEP_SERVICES);
         info.install_dep_services = PackageManager::PMSExplodeServiceString(value);
         extra->install_dep_service_set = PackageManager::getServiceSetFromString(value);
     }
     if (mask & INFO_MASK_START_DEP_SERVICES) {
-        value = keys.get(PKG_INFO_START_DEP_SERVICES);
+        const char* value = keys.get(PKG_INFO_START_DEP_SERVICES);
         info.start_dep_services = PackageManager::PMSExplodeServiceString(value);
         extra->start_dep_service_set = PackageManager::getServiceSetFromString(value);
     }
+}
 
-    // The UI directory name ends up in paths, so it obeys the name rule too.
+// Help, UI directory and application name. The UI directory name ends up in paths, so it
+// obeys the name rule too.
+bool readDesktop(const InfoKeys& keys, unsigned long long mask, PackageInfo& info) {
+    if (isNo(keys.get(PKG_INFO_CHECKPORT))) {
+        info.checkport = false;
+    }
+    const char* value;
+    if (mask & INFO_MASK_HELPURL) {
+        value = keys.get(PKG_INFO_HELPURL);
+        if (value != nullptr) {
+            info.helpurl = value;
+        }
+    }
     value = keys.get(PKG_INFO_NOSUIDIR);
     if (!isEmpty(value)) {
         if (!PMSIsLegalName(value, kUIDirNameForbidden)) {
@@ -351,23 +338,16 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
             info.nosappname = value;
         }
     }
+    return true;
+}
 
-    // "ctl_stop" is the newer name of "startable" and alone decides when present.
-    if ((mask & INFO_MASK_INSTALL_REBOOT) && isYes(keys.get(PKG_INFO_INSTALL_REBOOT))) {
-        info.install_reboot = true;
-    }
-    if (mask & INFO_MASK_STARTABLE) {
-        value = keys.get(PKG_INFO_CTL_STOP);
-        if (value == nullptr) {
-            value = keys.get(PKG_INFO_STARTABLE);
-        }
-        if (isNo(value)) {
-            info.startable = false;
-        }
-    }
-
-    // Dependencies and conflicts: the section file, when there is one, replaces the
-    // INFO key entirely.
+// Dependencies and conflicts: the section file, when there is one, replaces the INFO key
+// entirely.
+void readRelations(const InfoKeys& keys, const std::string& dir, unsigned long long mask,
+                   PackageInfo& info) {
+    const std::string depsPath = dir + "/conf/PKG_DEPS";
+    const std::string conxPath = dir + "/conf/PKG_CONX";
+    const char* value;
     if (mask & INFO_MASK_DEP_PACKAGES) {
         if (VLIBCFileExist(depsPath.c_str())) {
             PMSLoadDepConfFile(depsPath.c_str(), info.dep_packages);
@@ -382,8 +362,24 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
             PMSExplodeDepPKGString(value, info.conflict_packages);
         }
     }
+}
 
-    // The rest cannot fail.
+// Yes/no switches. "ctl_stop" is the newer name of "startable" and alone decides when
+// present; a package with a place to report problems is a beta, whatever "beta" says.
+void readSwitches(const InfoKeys& keys, unsigned long long mask, PackageInfo& info) {
+    PackageInfoExtraPrivate* extra = info.extra.priv();
+    if ((mask & INFO_MASK_INSTALL_REBOOT) && isYes(keys.get(PKG_INFO_INSTALL_REBOOT))) {
+        info.install_reboot = true;
+    }
+    if (mask & INFO_MASK_STARTABLE) {
+        const char* value = keys.get(PKG_INFO_CTL_STOP);
+        if (value == nullptr) {
+            value = keys.get(PKG_INFO_STARTABLE);
+        }
+        if (isNo(value)) {
+            info.startable = false;
+        }
+    }
     if ((mask & INFO_MASK_SILENT_INSTALL) && isYes(keys.get(PKG_INFO_SILENT_INSTALL))) {
         info.silent_install = true;
     }
@@ -393,7 +389,30 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
     if ((mask & INFO_MASK_SILENT_UNINSTALL) && isYes(keys.get(PKG_INFO_SILENT_UNINSTALL))) {
         info.silent_uninstall = true;
     }
-    value = keys.get(PKG_INFO_CHECKSUM);
+    if (mask & INFO_MASK_BETA) {
+        const char* value = keys.get(PKG_INFO_REPORT_URL);
+        if (!isEmpty(value)) {
+            info.report_url = value;
+            info.beta = true;
+        }
+        if (isYes(keys.get(PKG_INFO_BETA))) {
+            info.beta = true;
+        }
+    }
+    if ((mask & INFO_MASK_SUPPORT_CENTER) && isYes(keys.get(PKG_INFO_SUPPORT_CENTER))) {
+        info.support_center = true;
+    }
+    if (isYes(keys.get(PKG_INFO_PRECHECKSTARTSTOP))) {
+        extra->precheckstartstop = true;
+    }
+    if ((mask & INFO_MASK_CTL_UNINSTALL) && isNo(keys.get(PKG_INFO_CTL_UNINSTALL))) {
+        extra->ctl_uninstall = false;
+    }
+}
+
+// Plain values copied as they stand: checksum, icons, support page, size, install type.
+void readValues(const InfoKeys& keys, unsigned long long mask, PackageInfo& info) {
+    const char* value = keys.get(PKG_INFO_CHECKSUM);
     if (value != nullptr) {
         info.checksum = value;
     }
@@ -406,20 +425,6 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
         if (value != nullptr) {
             info.package_icon_256 = value;
         }
-    }
-    if (mask & INFO_MASK_BETA) {
-        // A package with a place to report problems is a beta, whatever "beta" says.
-        value = keys.get(PKG_INFO_REPORT_URL);
-        if (!isEmpty(value)) {
-            info.report_url = value;
-            info.beta = true;
-        }
-        if (isYes(keys.get(PKG_INFO_BETA))) {
-            info.beta = true;
-        }
-    }
-    if ((mask & INFO_MASK_SUPPORT_CENTER) && isYes(keys.get(PKG_INFO_SUPPORT_CENTER))) {
-        info.support_center = true;
     }
     if (mask & INFO_MASK_SUPPORT_URL) {
         value = keys.get(PKG_INFO_SUPPORT_URL);
@@ -439,14 +444,45 @@ bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* l
             info.install_type = value;
         }
     }
-    if (isYes(keys.get(PKG_INFO_PRECHECKSTARTSTOP))) {
-        extra->precheckstartstop = true;
-    }
-    if ((mask & INFO_MASK_CTL_UNINSTALL) && isNo(keys.get(PKG_INFO_CTL_UNINSTALL))) {
-        extra->ctl_uninstall = false;
-    }
+}
 
-    // The list and hash go with `keys`.
+}  // namespace
+
+bool PMSLoadPKGInfoFile(const std::string& dir, PackageInfo& info, const char* language,
+                        unsigned long long mask) {
+    const std::string infoPath = dir + "/INFO";
+    info = PackageInfo();
+
+    // Not a package directory: quietly no. An INFO that is no regular file (a named
+    // pipe would stall the read) is no INFO.
+    if (!VLIBCFileCheckDir(dir.c_str()) || !PMSIsRegularFile(infoPath)) {
+        return false;
+    }
+    InfoKeys keys;
+    if (!keys.ok()) {
+        CORV_LOG_ERR("Out of memory!!");
+        return false;
+    }
+    const std::string lang = wantKeys(keys, language, mask);
+    // One read of the file for every key.
+    if (keys.load(infoPath.c_str()) < 0) {
+        CORV_LOG_ERR("VLIBCFileGetKeys() failed!! szFile=[%s], corverr=[0x%04X]", infoPath.c_str(),
+                     VLIBCErrGet());
+        return false;
+    }
+    // The order of the checks decides which of several bad keys is logged.
+    if (!readIdentity(keys, infoPath, mask, info) || !readTexts(keys, lang, mask, info) ||
+        !readAdmin(keys, mask, info)) {
+        return false;
+    }
+    readPlatforms(keys, info);
+    readServices(keys, mask, info);
+    if (!readDesktop(keys, mask, info)) {
+        return false;
+    }
+    readSwitches(keys, mask, info);
+    readRelations(keys, dir, mask, info);
+    readValues(keys, mask, info);
     return true;
 }
 

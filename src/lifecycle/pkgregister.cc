@@ -55,101 +55,122 @@ bool PMSCheckPayloadTarget(const std::string& registry) {
     return ok;
 }
 
-bool PackageManager::registerPackage(PKG_INSTALLATION_TYPE type, PackageInfo& info,
-                                     const std::string& workDir, const std::string& target) {
-    const std::string registry = PMSRegistryDir(info.package);
+namespace {
+
+// Moves INFO, scripts, wizard files and conf from the unpacked package into the registry.
+// The flag goes in right after the directory, before anything can fail half-way, so that
+// an interrupted registration always shows as broken.
+bool moveControlFiles(const PackageInfo& local, PKG_INSTALLATION_TYPE type,
+                      const std::string& workDir, const std::string& registry) {
     CORVUtils::ProcessRunner mkdirRegistry("/bin/mkdir", {"-p", registry});
     CORVUtils::ProcessRunner mvInfo("/bin/mv", {"-f", workDir + "/INFO", registry + "/INFO"});
     CORVUtils::ProcessRunner rmScripts("/bin/rm", {"-rf", registry + "/scripts"});
     CORVUtils::ProcessRunner mvScripts("/bin/mv",
                                        {"-f", workDir + "/scripts", registry + "/scripts"});
-    CORVUtils::ProcessRunner rmWizard("/bin/rm", {"-rf", registry + "/WIZARD_UIFILES"});
-    CORVUtils::ProcessRunner mvWizard(
-        "/bin/mv", {"-f", workDir + "/WIZARD_UIFILES", registry + "/WIZARD_UIFILES"});
-    CORVUtils::ProcessRunner rmConf("/bin/rm", {"-rf", registry + "/conf"});
-    CORVUtils::ProcessRunner mvConf("/bin/mv", {"-f", workDir + "/conf", registry + "/conf"});
-
-    // Nothing has changed yet if the INFO is bad.
-    PackageInfo local;
-    bool ok = true;
-    bool outcome = false;
-    if (!PMSLoadPKGInfoFile(workDir, local, nullptr, PKG_INFO_MASK_ALL)) {
-        CORV_LOG_ERR("Failed to validate package INFO");
-        setResult(PKG_ERR_BAD_ARCHIVE);
+    bool ok = runLogged(local, type, mkdirRegistry);
+    const std::string flag = registry + "/installing";
+    int fd = open(flag.c_str(), O_CREAT | O_TRUNC | O_WRONLY | O_CLOEXEC, 0644);
+    if (fd < 0) {
+        CORV_LOG_ERR("Failed to create install flag file %s", flag.c_str());
     } else {
-        // The flag goes in right after the directory, before anything can fail
-        // half-way, so that an interrupted registration always shows as broken.
-        ok &= runLogged(local, type, mkdirRegistry);
-        const std::string flag = registry + "/installing";
-        int fd = open(flag.c_str(), O_CREAT | O_TRUNC | O_WRONLY | O_CLOEXEC, 0644);
-        if (fd < 0) {
-            CORV_LOG_ERR("Failed to create install flag file %s", flag.c_str());
-        } else {
-            close(fd);
+        close(fd);
+    }
+    ok &= runLogged(local, type, mvInfo);
+    ok &= runLogged(local, type, rmScripts);
+    ok &= runLogged(local, type, mvScripts);
+    for (const char* part : {"/WIZARD_UIFILES", "/conf"}) {
+        if (!VLIBCFileCheckDir((workDir + part).c_str())) {
+            continue;
         }
-        ok &= runLogged(local, type, mvInfo);
-        ok &= runLogged(local, type, rmScripts);
-        ok &= runLogged(local, type, mvScripts);
-        if (VLIBCFileCheckDir((workDir + "/WIZARD_UIFILES").c_str())) {
-            PMSRunAndWriteScriptLog(local, type, rmWizard, -1);
-            ok &= runLogged(local, type, mvWizard);
+        // A failed removal shows in the move that follows it.
+        CORVUtils::ProcessRunner rm("/bin/rm", {"-rf", registry + part});
+        PMSRunAndWriteScriptLog(local, type, rm, -1);
+        CORVUtils::ProcessRunner mv("/bin/mv", {"-f", workDir + part, registry + part});
+        ok &= runLogged(local, type, mv);
+    }
+    return ok;
+}
+
+// Points <registry>/target at the payload; the volume may be busy for a moment, so it is
+// tried for a while before giving up.
+bool linkTarget(const PackageInfo& local, PKG_INSTALLATION_TYPE type, const std::string& registry,
+                const std::string& target) {
+    const std::string link = registry + "/target";
+    for (int attempt = 1; attempt <= kTargetLinkTries; ++attempt) {
+        CORVUtils::ProcessRunner rmLink("/bin/rm", {"-rf", link});
+        PMSRunAndWriteScriptLog(local, type, rmLink, -1);
+        if (symlink(target.c_str(), link.c_str()) == 0) {
+            return true;
         }
-        bool confMoved = true;
-        if (VLIBCFileCheckDir((workDir + "/conf").c_str())) {
-            PMSRunAndWriteScriptLog(local, type, rmConf, -1);
-            confMoved = runLogged(local, type, mvConf);
-            ok &= confMoved;
-        }
-        if (ok && confMoved) {
-            const std::string link = registry + "/target";
-            bool linked = false;
-            for (int attempt = 1; attempt <= kTargetLinkTries && !linked; ++attempt) {
-                CORVUtils::ProcessRunner rmLink("/bin/rm", {"-rf", link});
-                PMSRunAndWriteScriptLog(local, type, rmLink, -1);
-                if (symlink(target.c_str(), link.c_str()) == 0) {
-                    linked = true;
-                } else {
-                    CORV_LOG_ERR("Failed to symlink %s, %m", link.c_str());
-                    if (attempt < kTargetLinkTries) {
-                        sleep(1);
-                    }
-                }
-            }
-            ok = linked;
-        }
-        // Settings survive upgrades and normal uninstalls, so they live apart.
-        const std::string etcDir = PMSPackageEtcDir(local.package);
-        if (!VLIBCFileCheckDir(etcDir.c_str())) {
-            CORVFSMkdirP("/usr/corv/etc/packages", nullptr, 1, -1, -1, 0755);
-            if (mkdir(etcDir.c_str(), 0755) != 0) {
-                CORV_LOG_ERR("Failed to mkdir [%s], %m", etcDir.c_str());
-                ok = false;
-            }
-        }
-        const std::string user = PMSGetPkgUserName(local.package);
-        if (!user.empty()) {
-            uid_t uid = 0;
-            gid_t gid = 0;
-            if (CORVUserGetUGID(user.c_str(), &uid, &gid) < 0) {
-                CORV_LOG_ERR("Failed to get ID of %s [0x%04X %s:%d]", user.c_str(), VLIBCErrGet(),
-                             VLIBCErrorGetFile(), VLIBCErrorGetLine());
-            } else if (chown(etcDir.c_str(), uid, gid) != 0) {
-                CORV_LOG_ERR("Failed to chown %s (%m)", etcDir.c_str());
-            }
-        }
-        if (ok) {
-            const std::string etcLink = registry + "/etc";
-            unlink(etcLink.c_str());
-            outcome = symlink(etcDir.c_str(), etcLink.c_str()) == 0;
+        CORV_LOG_ERR("Failed to symlink %s, %m", link.c_str());
+        if (attempt < kTargetLinkTries) {
+            sleep(1);
         }
     }
-    // The data must reach the disk even if the caller is killed right after.
+    return false;
+}
+
+// Settings survive upgrades and normal uninstalls, so they live apart, owned by the
+// package's user.
+bool makeEtcDir(const std::string& etcDir, const std::string& package) {
+    bool ok = true;
+    if (!VLIBCFileCheckDir(etcDir.c_str())) {
+        CORVFSMkdirP("/usr/corv/etc/packages", nullptr, 1, -1, -1, 0755);
+        if (mkdir(etcDir.c_str(), 0755) != 0) {
+            CORV_LOG_ERR("Failed to mkdir [%s], %m", etcDir.c_str());
+            ok = false;
+        }
+    }
+    const std::string user = PMSGetPkgUserName(package);
+    if (!user.empty()) {
+        uid_t uid = 0;
+        gid_t gid = 0;
+        if (CORVUserGetUGID(user.c_str(), &uid, &gid) < 0) {
+            CORV_LOG_ERR("Failed to get ID of %s [0x%04X %s:%d]", user.c_str(), VLIBCErrGet(),
+                         VLIBCErrorGetFile(), VLIBCErrorGetLine());
+        } else if (chown(etcDir.c_str(), uid, gid) != 0) {
+            CORV_LOG_ERR("Failed to chown %s (%m)", etcDir.c_str());
+        }
+    }
+    return ok;
+}
+
+// The data must reach the disk even if the caller is killed right after.
+void syncSoon() {
     pid_t child = VLIBCProcFork();
     if (child == 0) {
         sleep(1);
         sync();
         _exit(0);
     }
+}
+
+}  // namespace
+
+bool PackageManager::registerPackage(PKG_INSTALLATION_TYPE type, PackageInfo& info,
+                                     const std::string& workDir, const std::string& target) {
+    const std::string registry = PMSRegistryDir(info.package);
+    // Nothing has changed yet if the INFO is bad.
+    PackageInfo local;
+    if (!PMSLoadPKGInfoFile(workDir, local, nullptr, PKG_INFO_MASK_ALL)) {
+        CORV_LOG_ERR("Failed to validate package INFO");
+        setResult(PKG_ERR_BAD_ARCHIVE);
+        syncSoon();
+        return false;
+    }
+    bool ok = moveControlFiles(local, type, workDir, registry);
+    if (ok) {
+        ok = linkTarget(local, type, registry, target);
+    }
+    const std::string etcDir = PMSPackageEtcDir(local.package);
+    ok = makeEtcDir(etcDir, local.package) && ok;
+    bool outcome = false;
+    if (ok) {
+        const std::string etcLink = registry + "/etc";
+        unlink(etcLink.c_str());
+        outcome = symlink(etcDir.c_str(), etcLink.c_str()) == 0;
+    }
+    syncSoon();
     return outcome;
 }
 

@@ -152,6 +152,70 @@ std::string untilNul(const std::string& data) {
     return data.substr(0, data.find('\0'));
 }
 
+// The kind of member a ustar type flag names; none for a type a package never needs.
+std::optional<TarMember::Kind> kindOf(char type) {
+    switch (type) {
+        case '0':
+        case '\0':
+        case '7':
+            return TarMember::kFile;
+        case '1':
+            return TarMember::kHardLink;
+        case '2':
+            return TarMember::kSymLink;
+        case '3':
+            return TarMember::kCharDevice;
+        case '4':
+            return TarMember::kBlockDevice;
+        case '5':
+            return TarMember::kDirectory;
+        case '6':
+            return TarMember::kFifo;
+        default:
+            return std::nullopt;
+    }
+}
+
+// Names, mode, size and device numbers of a member header, with what the extended
+// headers before it said winning over the header's own fields.
+void describeMember(const char* block, uint64_t at, uint64_t size, const PaxValues& pax,
+                    const std::optional<std::string>& longName,
+                    const std::optional<std::string>& longLink, const std::string& what,
+                    TarMember& member) {
+    // Only POSIX ustar ("ustar\0") has a name prefix; GNU's header keeps other data there.
+    const bool posix = block[kMagic.at + 5] == '\0';
+    std::string name = text(block, kName);
+    if (posix && block[kPrefix.at] != '\0') {
+        name = text(block, kPrefix) + "/" + name;
+    }
+    member.name = pax.path ? *pax.path : longName ? *longName : name;
+    member.linkName = pax.linkPath ? *pax.linkPath : longLink ? *longLink : text(block, kLinkName);
+    member.size = pax.size ? *pax.size : size;
+    const std::optional<uint64_t> mode = number(block, kMode);
+    if (!mode) {
+        throw Failure(what + ": bad mode field in the header at offset " + std::to_string(at));
+    }
+    member.mode = static_cast<unsigned>(*mode & 07777);
+    if (member.kind == TarMember::kCharDevice || member.kind == TarMember::kBlockDevice) {
+        const std::optional<uint64_t> major = number(block, kDevMajor);
+        const std::optional<uint64_t> minor = number(block, kDevMinor);
+        if (!major || !minor || *major > 0xffffffff || *minor > 0xffffffff) {
+            throw Failure(what + ": bad device numbers at offset " + std::to_string(at));
+        }
+        member.devMajor = static_cast<unsigned>(*major);
+        member.devMinor = static_cast<unsigned>(*minor);
+    }
+    if (member.name.empty()) {
+        throw Failure(what + ": a member without a name at offset " + std::to_string(at));
+    }
+    if (member.kind != TarMember::kFile && member.size != 0) {
+        throw Failure(what + ": member " + member.name + " is not a file but has content");
+    }
+    if (member.size > kSizeLimit) {
+        throw Failure(what + ": member " + member.name + " is impossibly large");
+    }
+}
+
 }  // namespace
 
 TarReader::TarReader(int fd, std::string what) : fd_(fd), what_(std::move(what)) {}
@@ -287,68 +351,13 @@ bool TarReader::next(TarMember& member) {
             (type == 'L' ? longName : longLink) = untilNul(data.substr(0, *size));
             continue;
         }
-        switch (type) {
-            case '0':
-            case '\0':
-            case '7':
-                member.kind = TarMember::kFile;
-                break;
-            case '1':
-                member.kind = TarMember::kHardLink;
-                break;
-            case '2':
-                member.kind = TarMember::kSymLink;
-                break;
-            case '3':
-                member.kind = TarMember::kCharDevice;
-                break;
-            case '4':
-                member.kind = TarMember::kBlockDevice;
-                break;
-            case '5':
-                member.kind = TarMember::kDirectory;
-                break;
-            case '6':
-                member.kind = TarMember::kFifo;
-                break;
-            default:
-                throw Failure(what_ + ": unsupported member type '" + std::string(1, type) +
-                              "' at offset " + std::to_string(at));
+        const std::optional<TarMember::Kind> kind = kindOf(type);
+        if (!kind) {
+            throw Failure(what_ + ": unsupported member type '" + std::string(1, type) +
+                          "' at offset " + std::to_string(at));
         }
-        // Only POSIX ustar ("ustar\0") has a name prefix; GNU's header keeps other data there.
-        const bool posix = block[kMagic.at + 5] == '\0';
-        std::string name = text(block, kName);
-        if (posix && block[kPrefix.at] != '\0') {
-            name = text(block, kPrefix) + "/" + name;
-        }
-        member.name = pax.path ? *pax.path : longName ? *longName : name;
-        member.linkName = pax.linkPath ? *pax.linkPath
-                          : longLink   ? *longLink
-                                       : text(block, kLinkName);
-        member.size = pax.size ? *pax.size : *size;
-        const std::optional<uint64_t> mode = number(block, kMode);
-        if (!mode) {
-            throw Failure(what_ + ": bad mode field in the header at offset " + std::to_string(at));
-        }
-        member.mode = static_cast<unsigned>(*mode & 07777);
-        if (member.kind == TarMember::kCharDevice || member.kind == TarMember::kBlockDevice) {
-            const std::optional<uint64_t> major = number(block, kDevMajor);
-            const std::optional<uint64_t> minor = number(block, kDevMinor);
-            if (!major || !minor || *major > 0xffffffff || *minor > 0xffffffff) {
-                throw Failure(what_ + ": bad device numbers at offset " + std::to_string(at));
-            }
-            member.devMajor = static_cast<unsigned>(*major);
-            member.devMinor = static_cast<unsigned>(*minor);
-        }
-        if (member.name.empty()) {
-            throw Failure(what_ + ": a member without a name at offset " + std::to_string(at));
-        }
-        if (member.kind != TarMember::kFile && member.size != 0) {
-            throw Failure(what_ + ": member " + member.name + " is not a file but has content");
-        }
-        if (member.size > kSizeLimit) {
-            throw Failure(what_ + ": member " + member.name + " is impossibly large");
-        }
+        member.kind = *kind;
+        describeMember(block, at, *size, pax, longName, longLink, what_, member);
         contentSize_ = member.size;
         contentRead_ = false;
         return true;

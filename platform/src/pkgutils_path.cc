@@ -65,10 +65,9 @@ std::string realPathOf(const std::string& path) {
     return real ? std::string(real.get()) : std::string();
 }
 
-// The checks shared by both helpers. On success `cleaned` holds the relative path's
-// components and `exists` whether the whole path exists. On failure the error is set.
-bool checkRelPath(const std::string& root, const std::string& relative,
-                  std::vector<std::string>& cleaned, bool& exists) {
+// The relative path's own form: not empty, not absolute, no "..", not the root itself.
+bool checkRelForm(const std::string& root, const std::string& relative,
+                  std::vector<std::string>& cleaned) {
     if (root.empty() || relative.empty()) {
         VLIBCErrSet(ERR_BAD_PARAMETERS);
         return false;
@@ -88,19 +87,15 @@ bool checkRelPath(const std::string& root, const std::string& relative,
         VLIBCErrSet(ERR_BAD_PARAMETERS);
         return false;
     }
-    const std::string rootReal = realPathOf(root);
-    struct stat st {};
-    if (rootReal.empty() || stat(rootReal.c_str(), &st) != 0 || !S_ISDIR(st.st_mode)) {
-        VLIBCErrSet(ERR_BAD_PARAMETERS);
-        return false;
-    }
+    return true;
+}
 
-    // Walk the path as the kernel would, one component at a time, following every link,
-    // and see where it ends. Once a component is missing, nothing after it can be a link,
-    // and the rest is taken as written.
+// Walks the path as the kernel would, one component at a time from `resolved`, following
+// every link, and leaves in `resolved` where it ends. Once a component is missing, nothing
+// after it can be a link, and the rest is taken as written.
+bool walkPath(const std::vector<std::string>& cleaned, std::string& resolved, bool& missing) {
     std::deque<std::string> pending(cleaned.begin(), cleaned.end());
-    std::string resolved = rootReal;
-    bool missing = false;
+    missing = false;
     int links = 0;
     while (!pending.empty()) {
         std::string part = pending.front();
@@ -110,13 +105,9 @@ bool checkRelPath(const std::string& root, const std::string& relative,
             continue;
         }
         std::string next = joinPath(resolved, part);
-        if (missing) {
-            resolved = next;
-            continue;
-        }
         struct stat lst {};
-        if (lstat(next.c_str(), &lst) != 0) {
-            if (errno != ENOENT && errno != ENOTDIR) {
+        if (missing || lstat(next.c_str(), &lst) != 0) {
+            if (!missing && errno != ENOENT && errno != ENOTDIR) {
                 VLIBCErrSet(ERR_STAT_FAILED);
                 return false;
             }
@@ -145,6 +136,27 @@ bool checkRelPath(const std::string& root, const std::string& relative,
         // The target's components come before the rest of the path.
         std::vector<std::string> targetParts = splitPath(target);
         pending.insert(pending.begin(), targetParts.begin(), targetParts.end());
+    }
+    return true;
+}
+
+// The checks shared by both helpers. On success `cleaned` holds the relative path's
+// components and `exists` whether the whole path exists. On failure the error is set.
+bool checkRelPath(const std::string& root, const std::string& relative,
+                  std::vector<std::string>& cleaned, bool& exists) {
+    if (!checkRelForm(root, relative, cleaned)) {
+        return false;
+    }
+    const std::string rootReal = realPathOf(root);
+    struct stat st {};
+    if (rootReal.empty() || stat(rootReal.c_str(), &st) != 0 || !S_ISDIR(st.st_mode)) {
+        VLIBCErrSet(ERR_BAD_PARAMETERS);
+        return false;
+    }
+    std::string resolved = rootReal;
+    bool missing = false;
+    if (!walkPath(cleaned, resolved, missing)) {
+        return false;
     }
     if (!isInside(resolved, rootReal)) {
         VLIBCErrSet(ERR_OUTSIDE_PACKAGE);

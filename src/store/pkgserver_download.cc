@@ -1,7 +1,6 @@
 // The transfer of a package file from a store into a temporary folder, under the task
 // record that the desktop polls.
 #include <curl/curl.h>
-#include <openssl/evp.h>
 #include <signal.h>
 #include <stdio.h>
 #include <string.h>
@@ -18,6 +17,7 @@
 #include "corvpkg/packagemanager.h"
 #include "corvpkg/pkgcurltool.h"
 #include "corvpkg/pkgserver.h"
+#include "store/digest_pipe.h"
 #include "store/pkgserver_private.h"
 
 namespace CORVPackageTool {
@@ -66,7 +66,7 @@ struct Transfer {
     NOS::Task* task = nullptr;
     bool blqinst = false;
     FILE* file = nullptr;
-    EVP_MD_CTX* md5 = nullptr;
+    DigestPipe md5;
     bool aborted = false;  // the task record went away
     double lastFraction = -1;
     long long lastReportMs = 0;
@@ -74,23 +74,9 @@ struct Transfer {
         if (file != nullptr) {
             fclose(file);
         }
-        EVP_MD_CTX_free(md5);
     }
-    bool restart() { return EVP_DigestInit_ex(md5, EVP_md5(), nullptr) == 1; }
-    std::string digest() {
-        unsigned char bytes[EVP_MAX_MD_SIZE];
-        unsigned int length = 0;
-        if (EVP_DigestFinal_ex(md5, bytes, &length) != 1) {
-            return "";
-        }
-        static const char kHex[] = "0123456789abcdef";
-        std::string hex;
-        for (unsigned int i = 0; i < length; ++i) {
-            hex += kHex[bytes[i] >> 4];
-            hex += kHex[bytes[i] & 0xF];
-        }
-        return hex;
-    }
+    bool restart() { return md5.restart(); }
+    std::string digest() { return md5.finish(); }
 };
 
 size_t writeChunk(char* bytes, size_t size, size_t count, void* context) {
@@ -100,7 +86,7 @@ size_t writeChunk(char* bytes, size_t size, size_t count, void* context) {
         CORV_LOG_ERR("Failed to write the package file, %m");
         return 0;
     }
-    EVP_DigestUpdate(t->md5, bytes, total);
+    t->md5.feed(bytes, total);
     return total;
 }
 
@@ -253,14 +239,13 @@ bool transfer(NOS::Task* task, bool blqinst, const char* displayName, const char
     Transfer t;
     t.task = task;
     t.blqinst = blqinst;
-    t.md5 = EVP_MD_CTX_new();
     t.file = fopen(filePath.c_str(), "w");
     if (t.file == nullptr) {
         CORV_LOG_ERR("Failed to open temp file [%s] [%m]", filePath.c_str());
         return false;
     }
     CurlOwner handle{curl_easy_init()};
-    if (handle.curl == nullptr || t.md5 == nullptr || !t.restart()) {
+    if (handle.curl == nullptr || !t.restart()) {
         CORV_LOG_ERR("Failed to init curl.");
         return false;
     }

@@ -49,9 +49,7 @@ int storeList(const Command& self, const std::vector<std::string>& args) {
         return usageError(self, "unexpected argument " + opts.positional[0]);
     }
     const std::string language = languageOf(opts);
-    // A list of thousands of entries is hundreds of thousands of small allocations; the
-    // end of the process gives them back at once, faster than the destructor would.
-    Json::Value& list = *new Json::Value;
+    Json::Value list;
     Json::Value errors;
     LogCapture log;
     if (!CORVPackageServer::PMSGetAllPkgList(opts.has("--refresh"), language.c_str(), list,
@@ -64,7 +62,6 @@ int storeList(const Command& self, const std::vector<std::string>& args) {
         out["packages"].swap(list);
         out["errors"] = errors;
         printLarge(out);
-        list.swap(out);  // left to the end of the process as well
         return EXIT_OK;
     }
     printf("%-24s %-16s %-28s %s\n", "NAME", "VERSION", "DISPLAY NAME", "SOURCE");

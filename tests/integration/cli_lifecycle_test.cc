@@ -80,6 +80,15 @@ TEST(CliLifecycle, InstallReinstallDowngradeUninstall) {
     EXPECT_EQ(r.out, "upgraded demo\n");
     EXPECT_EQ(testutil::scriptsRan("demo").front(), "preupgrade");
 
+    // A damaged payload is refused before the installed package is stopped.
+    testutil::clearRecords("demo");
+    withWrongChecksum(v2, "/tmp/damaged-v2.cpk");
+    r = corvpkg({"upgrade", "/tmp/damaged-v2.cpk", "--no-verify", "--json"});
+    EXPECT_EQ(r.status, 1);
+    EXPECT_EQ(json(r)["name"].asString(), "PKG_ERR_BAD_ARCHIVE");
+    EXPECT_TRUE(testutil::scriptsRan("demo").empty());
+    EXPECT_EQ(status("demo"), 0);
+
     const std::string v1 = testutil::buildPackage(testutil::recordingPackage("demo", "1.0-0001"));
     r = corvpkg({"install", v1, "--no-verify", "--json"});
     EXPECT_EQ(r.status, 1);

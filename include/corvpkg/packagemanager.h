@@ -45,6 +45,13 @@ class CORVPKG_API PackageManager {
     // Process-wide: skip the OS-upgrade flag in ExLock (the flag of a shutdown still holds).
     static void setSkipUpgradeCheck(bool skip);
 
+    // Off by default. When on, install and upgrade compare the payload archive with the
+    // INFO key "checksum" while they unpack it and refuse a mismatch (PKG_ERR_BAD_ARCHIVE)
+    // before anything lasting is done: for a caller whose check of the file left the
+    // payload out, so that the archive is hashed beside the unpacking, not before it.
+    void setChecksumWhileUnpacking(bool on);
+    bool checksumWhileUnpacking() const;
+
     // The result channel. setResult(code) clears the data.
     void setResult(PKG_ERRCODE code);
     void setResult(PKG_ERRCODE code, Json::Value data);

@@ -67,6 +67,14 @@ bool PackageManager::init() {
     return true;
 }
 
+void PackageManager::setChecksumWhileUnpacking(bool on) {
+    d->checksumWhileUnpacking = on;
+}
+
+bool PackageManager::checksumWhileUnpacking() const {
+    return d->checksumWhileUnpacking;
+}
+
 void PackageManager::setResult(PKG_ERRCODE code) {
     d->result = code;
     d->resultData = Json::Value();

@@ -20,6 +20,7 @@ class PackageManagerPrivate {
     std::map<std::string, std::string> params;
     // The package the manager describes: what the last lifecycle operation worked on.
     PackageInfo packageInfo;
+    bool checksumWhileUnpacking = false;
 };
 
 }  // namespace CORVPackageTool

@@ -6,6 +6,7 @@
 #include <string>
 #include <vector>
 
+#include "catalogue/pkgchecksum.h"
 #include "corv/log.h"
 #include "corv/process_runner.h"
 #include "corv/vlibc.h"
@@ -168,27 +169,11 @@ bool PackageManager::verifyPackageTgzFile(const std::string& cpkFile, const char
 }
 
 bool PMSCompareCheckSum(const char* path, const char* expected) {
-    if (path == nullptr || expected == nullptr || !VLIBCFileExist(path)) {
+    if (path == nullptr || expected == nullptr) {
         return false;
     }
-    FILE* out = VLIBCPopen("/usr/bin/openssl", "r", "md5", path, nullptr);
-    char line[1024] = "";
-    bool read = out != nullptr && fgets(line, sizeof(line), out) != nullptr;
-    if (out != nullptr) {
-        VLIBCPclose(out);
-    }
-    if (!read) {
-        CORV_LOG_ERR("%s failed, path=%s", "/usr/bin/openssl md5", path);
-        return false;
-    }
-    line[strcspn(line, "\n")] = '\0';
-    const char* sum = strstr(line, "= ");
-    if (sum == nullptr) {
-        CORV_LOG_ERR("Invalid output");
-        return false;
-    }
-    // Byte for byte: the INFO key must be in the tool's lower case.
-    return strcmp(sum + 2, expected) == 0;
+    PendingChecksum checksum;
+    return checksum.start(path) && checksum.matches(expected);
 }
 
 }  // namespace CORVPackageTool

@@ -31,10 +31,25 @@ PKG_ERRCODE volumeError(int platformError) {
     }
 }
 
-// The steps in their fixed order; `code` says which refused.
-bool checkFile(const char* language, const char* cpkFile, PKG_ERRCODE& code, Json::Value& data,
-               PackageInfo& info) {
-    PackageManager pm;
+// The payload against the INFO key "checksum"; false with `code` and `data` of a mismatch.
+bool checkPayload(PackageManager& pm, const char* cpkFile, const PackageInfo& info,
+                  PKG_ERRCODE& code, Json::Value& data) {
+    if (info.checksum.empty() || pm.verifyPackageTgzFile(cpkFile, info.checksum.c_str())) {
+        return true;
+    }
+    code = PKG_ERR_BAD_ARCHIVE;
+    data = Json::Value(Json::objectValue);
+    // A payload that did not fit is no damage: say so beside the fixed report.
+    const Json::Value space = pm.getJsonParam("no_space");
+    if (space.isObject()) {
+        data["no_space"] = space;
+    }
+    return false;
+}
+
+// The steps up to the payload, in their fixed order; `code` says which refused.
+bool checkRecord(PackageManager& pm, const char* language, const char* cpkFile, PKG_ERRCODE& code,
+                 Json::Value& data, PackageInfo& info, unsigned int skip) {
     if (language == nullptr) {
         code = PKG_ERR_SYSTEM;
         return false;
@@ -49,15 +64,12 @@ bool checkFile(const char* language, const char* cpkFile, PKG_ERRCODE& code, Jso
         code = volumeError(VLIBCErrGet());
         return false;
     }
-    if (!info.checksum.empty() && !pm.verifyPackageTgzFile(cpkFile, info.checksum.c_str())) {
-        code = PKG_ERR_BAD_ARCHIVE;
-        // A payload that did not fit is no damage: say so beside the fixed report.
-        const Json::Value space = pm.getJsonParam("no_space");
-        if (space.isObject()) {
-            data["no_space"] = space;
-        }
-        return false;
-    }
+    return (skip & PKG_FILE_CHECK_SKIP_PAYLOAD) != 0 || checkPayload(pm, cpkFile, info, code, data);
+}
+
+// The steps after the payload, in their fixed order; `code` says which refused.
+bool checkRest(PackageManager& pm, const char* language, const char* cpkFile, PKG_ERRCODE& code,
+               Json::Value& data, PackageInfo& info, unsigned int skip) {
     switch (PMSComparePackageAndOSVersion(info)) {
         case 1:
             code = PKG_ERR_OS_TOO_NEW;
@@ -118,6 +130,11 @@ bool checkFile(const char* language, const char* cpkFile, PKG_ERRCODE& code, Jso
         code = PKG_ERR_UPGRADE_FAILED;
         return false;
     }
+    // A caller that installs the file unverified would only throw the verdict away, and
+    // the signature tool reads the whole file once more.
+    if ((skip & PKG_FILE_CHECK_SKIP_SIGNATURE) != 0) {
+        return true;
+    }
     PKG_ERRCODE signature = PackageManager::verifyPackageSignature(cpkFile);
     if (signature == PKG_SIGNATURE_OK) {
         return true;
@@ -141,12 +158,25 @@ Json::Value memberNames(const Json::Value& object) {
 }  // namespace
 
 bool CheckPackageFileInfoImpl(const char* language, const char* cpkFile, std::string& displayName,
-                              PKG_ERRCODE& code, Json::Value& data, PackageInfo& info) {
+                              PKG_ERRCODE& code, Json::Value& data, PackageInfo& info,
+                              unsigned int skip) {
     code = PKG_OK;
     data = Json::Value(Json::objectValue);
-    bool ok = checkFile(language, cpkFile, code, data, info);
+    PackageManager pm;
+    const bool recordOk = checkRecord(pm, language, cpkFile, code, data, info, skip);
+    const bool ok = recordOk && checkRest(pm, language, cpkFile, code, data, info, skip);
+    // A payload left for later still comes before the later reasons against the file.
+    if (recordOk && !ok && (skip & PKG_FILE_CHECK_SKIP_PAYLOAD) != 0) {
+        checkPayload(pm, cpkFile, info, code, data);
+    }
     displayName = info.displayname;
     return ok;
+}
+
+bool CheckPackageFileInfoImpl(const char* language, const char* cpkFile, std::string& displayName,
+                              PKG_ERRCODE& code, Json::Value& data, PackageInfo& info) {
+    return CheckPackageFileInfoImpl(language, cpkFile, displayName, code, data, info,
+                                    PKG_FILE_CHECK_SKIP_NONE);
 }
 
 bool CheckPackageFileInfo(const char* language, const char* cpkFile, std::string& displayName,
@@ -158,7 +188,18 @@ bool CheckPackageFileInfo(const char* language, const char* cpkFile, std::string
     if (CheckPackageFileInfoImpl(language, cpkFile, displayName, code, data, info)) {
         return true;
     }
+    CheckPackageFileReport(code, data, info, report);
+    return false;
+}
+
+void CheckPackageFileReport(PKG_ERRCODE code, const Json::Value& data, const PackageInfo& info,
+                            Json::Value& report) {
+    report = Json::Value(Json::arrayValue);
     auto add = [&](const std::string& text) { report.append(text); };
+    auto osMaxVersion = [&info]() {
+        PackageInfo record = info;
+        return PMSOSVersionText(PMSGetOSMaxVer(record));
+    };
     switch (code) {
         case PKG_ERR_BROKEN:
             add("pkgmgr:pkgmgr_file_not_package");
@@ -241,17 +282,16 @@ bool CheckPackageFileInfo(const char* language, const char* cpkFile, std::string
         // The upper limit is shown in both cases, also where the lower one failed.
         case PKG_ERR_OS_TOO_NEW:
             add("pkgmgr:pkgmgr_pkg_required_older_version");
-            add(PMSOSVersionText(PMSGetOSMaxVer(info)));
+            add(osMaxVersion());
             break;
         case PKG_ERR_OS_TOO_OLD:
             add("pkgmgr:pkgmgr_pkg_required_newer_version");
-            add(PMSOSVersionText(PMSGetOSMaxVer(info)));
+            add(osMaxVersion());
             break;
         default:
             add("error:error_error_system");
             break;
     }
-    return false;
 }
 
 }  // namespace CORVPackageTool

@@ -8,6 +8,7 @@
 #include <string>
 #include <vector>
 
+#include "catalogue/pkgchecksum.h"
 #include "corv/log.h"
 #include "corv/pkgutils.h"
 #include "corv/process_runner.h"
@@ -34,6 +35,32 @@ InstallCommands::InstallCommands(const std::string& cpkPath, const std::string& 
 bool PMSRunLogged(const PackageInfo& info, PKG_INSTALLATION_TYPE type,
                   CORVUtils::ProcessRunner& runner) {
     return PMSRunAndWriteScriptLog(info, type, runner, -1) == 0;
+}
+
+bool PMSUnpackPayload(PackageManager& pm, const PackageInfo& info, PKG_INSTALLATION_TYPE type,
+                      InstallCommands& cmd, const std::string& cpkPath,
+                      const std::string& workDir) {
+    const std::string archive = workDir + "/package.tgz";
+    PendingChecksum checksum;
+    const bool verify = pm.checksumWhileUnpacking() && !info.checksum.empty();
+    // Both read the same archive from the page cache; the hash takes the other core while
+    // tar and its decompressor take this one.
+    if (verify) {
+        checksum.start(archive.c_str());
+    }
+    if (!PMSRunLogged(info, type, cmd.extractPayload) ||
+        !PMSDropSpecialFiles(workDir + "/package")) {
+        CORV_LOG_ERR("Failed to unpack package.tgz, %s", cpkPath.c_str());
+        PMSExplainFailedUnpack(pm, workDir + "/package", PMSPayloadSize(info, workDir));
+        pm.setResult(PKG_ERR_BAD_ARCHIVE);
+        return false;
+    }
+    if (verify && !checksum.matches(info.checksum.c_str())) {
+        CORV_LOG_ERR("Failed to verify %s", cpkPath.c_str());
+        pm.setResult(PKG_ERR_BAD_ARCHIVE);
+        return false;
+    }
+    return true;
 }
 
 namespace {

@@ -100,14 +100,7 @@ bool checkNotInstalled(InstallRoad& r) {
 }
 
 bool unpackPayload(InstallRoad& r) {
-    if (!PMSRunLogged(r.info, kInstall, r.cmd.extractPayload) ||
-        !PMSDropSpecialFiles(r.workDir + "/package")) {
-        CORV_LOG_ERR("Failed to unpack package.tgz, %s", r.cpkPath.c_str());
-        PMSExplainFailedUnpack(r.pm, r.workDir + "/package", PMSPayloadSize(r.info, r.workDir));
-        r.pm.setResult(PKG_ERR_BAD_ARCHIVE);
-        return false;
-    }
-    return true;
+    return PMSUnpackPayload(r.pm, r.info, kInstall, r.cmd, r.cpkPath, r.workDir);
 }
 
 // The message file the scripts write to, a fresh progress file, and what every install

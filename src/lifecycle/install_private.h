@@ -39,6 +39,13 @@ bool PMSUnpackAndCheck(const char* road, PackageManager& pm, PKG_INSTALLATION_TY
                        InstallCommands& cmd, const std::string& cpkPath, const std::string& workDir,
                        PackageInfo& info, bool nameTheDir);
 
+// Unpacks <workDir>/package.tgz into <workDir>/package (the road's `extractPayload`) and
+// drops what may never be installed from it. When the manager checks the payload while
+// unpacking, the archive is hashed beside the tar run and a mismatch with the INFO key
+// "checksum" refuses it. False with the result PKG_ERR_BAD_ARCHIVE (logged).
+bool PMSUnpackPayload(PackageManager& pm, const PackageInfo& info, PKG_INSTALLATION_TYPE type,
+                      InstallCommands& cmd, const std::string& cpkPath,
+                      const std::string& workDir);
 // What the install scripts of one operation share.
 struct ScriptContext {
     const char* language = nullptr;

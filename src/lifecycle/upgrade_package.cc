@@ -145,14 +145,7 @@ bool refuseDowngrade(UpgradeRoad& r) {
 }
 
 bool unpackPayload(UpgradeRoad& r) {
-    if (!PMSRunLogged(r.newInfo, kUpgrade, r.cmd.extractPayload) ||
-        !PMSDropSpecialFiles(r.workDir + "/package")) {
-        CORV_LOG_ERR("Failed to unpack package.tgz, %s", r.cpkPath.c_str());
-        PMSExplainFailedUnpack(r.pm, r.workDir + "/package", PMSPayloadSize(r.newInfo, r.workDir));
-        r.pm.setResult(PKG_ERR_BAD_ARCHIVE);
-        return false;
-    }
-    return true;
+    return PMSUnpackPayload(r.pm, r.newInfo, kUpgrade, r.cmd, r.cpkPath, r.workDir);
 }
 
 // The message file, a fresh progress file, and what every script of the upgrade is given.

@@ -2,7 +2,6 @@
 // DNS fallback policy, the reading of the status.
 #include "corvpkg/pkgcurltool.h"
 
-#include <curl/curl.h>
 #include <fcntl.h>
 #include <stdio.h>
 #include <stdlib.h>
@@ -16,6 +15,7 @@
 #include "corv/nsinfo.h"
 #include "corv/vlibc.h"
 #include "corvpkg/pkgtypes.h"
+#include "store/curl_api.h"
 #include "store/pkgserver_private.h"
 
 namespace CORVPackageTool {
@@ -25,13 +25,13 @@ CURLcode PMSRetryWithFallbackDns(CURL* curl, CURLcode first) {
         return first;
     }
     CORV_LOG_ERR("Fallback dns to %s", PKG_CURL_FALLBACK_DNS);
-    CURLcode set = curl_easy_setopt(curl, CURLOPT_DNS_SERVERS, PKG_CURL_FALLBACK_DNS);
+    CURLcode set = PMSCurl().easy_setopt(curl, CURLOPT_DNS_SERVERS, PKG_CURL_FALLBACK_DNS);
     if (set != CURLE_OK) {
         CORV_LOG_ERR("Failed to set CURLOPT_DNS_SERVERS, return value=%d, err=%s", set,
-                     curl_easy_strerror(set));
+                     PMSCurl().easy_strerror(set));
         return first;
     }
-    return curl_easy_perform(curl);
+    return PMSCurl().easy_perform(curl);
 }
 
 namespace {
@@ -41,7 +41,7 @@ std::string g_lastFailure;
 
 // The words for a transfer that ended with `code`.
 std::string describeCurlFailure(CURLcode code, bool overLimit) {
-    const std::string detail = std::string(" (") + curl_easy_strerror(code) + ")";
+    const std::string detail = std::string(" (") + PMSCurl().easy_strerror(code) + ")";
     switch (code) {
         case CURLE_COULDNT_RESOLVE_PROXY:
         case CURLE_COULDNT_RESOLVE_HOST:
@@ -107,10 +107,10 @@ class CurlHandle {
     CurlHandle() = default;
     ~CurlHandle() {
         if (curl_ != nullptr) {
-            curl_easy_cleanup(curl_);
+            PMSCurl().easy_cleanup(curl_);
         }
         if (global_) {
-            curl_global_cleanup();
+            PMSCurl().global_cleanup();
         }
     }
     CurlHandle(const CurlHandle&) = delete;
@@ -150,23 +150,24 @@ bool isRetryable(CURLcode code) {
 // One perform; an unresolvable host gets a second perform with the fallback DNS server,
 // which stays set on the handle for the attempts that follow.
 CURLcode performWithDnsFallback(CURL* curl) {
-    CURLcode code = curl_easy_perform(curl);
+    CURLcode code = PMSCurl().easy_perform(curl);
     if (code != CURLE_OK) {
-        CORV_LOG_ERR("Failed to curl perform, code=%d, err=%s", code, curl_easy_strerror(code));
+        CORV_LOG_ERR("Failed to curl perform, code=%d, err=%s", code,
+                     PMSCurl().easy_strerror(code));
     }
     return PMSRetryWithFallbackDns(curl, code);
 }
 
 bool setTlsOptions(CURL* curl) {
     CURLcode code;
-    if ((code = curl_easy_setopt(curl, CURLOPT_SSL_VERIFYPEER, 1L)) != CURLE_OK ||
-        (code = curl_easy_setopt(curl, CURLOPT_SSL_VERIFYHOST, 2L)) != CURLE_OK ||
+    if ((code = PMSCurl().easy_setopt(curl, CURLOPT_SSL_VERIFYPEER, 1L)) != CURLE_OK ||
+        (code = PMSCurl().easy_setopt(curl, CURLOPT_SSL_VERIFYHOST, 2L)) != CURLE_OK ||
         // The bundle file goes to the directory option, as the appliance has always set
         // it; libcurl's own default bundle is the same file.
-        (code = curl_easy_setopt(curl, CURLOPT_CAPATH, PKG_CURL_CA_BUNDLE)) != CURLE_OK ||
-        (code = curl_easy_setopt(curl, CURLOPT_SSLVERSION, (long)CURL_SSLVERSION_TLSv1)) !=
+        (code = PMSCurl().easy_setopt(curl, CURLOPT_CAPATH, PKG_CURL_CA_BUNDLE)) != CURLE_OK ||
+        (code = PMSCurl().easy_setopt(curl, CURLOPT_SSLVERSION, (long)CURL_SSLVERSION_TLSv1)) !=
             CURLE_OK) {
-        CORV_LOG_ERR("Failed to set curl opt error:(%d)%s", code, curl_easy_strerror(code));
+        CORV_LOG_ERR("Failed to set curl opt error:(%d)%s", code, PMSCurl().easy_strerror(code));
         return false;
     }
     return true;
@@ -174,16 +175,16 @@ bool setTlsOptions(CURL* curl) {
 
 // Bounds on redirects: without them a redirect loop would never end.
 bool setRedirectOptions(CURL* curl) {
-    CURLcode code = curl_easy_setopt(curl, CURLOPT_FOLLOWLOCATION, 1L);
+    CURLcode code = PMSCurl().easy_setopt(curl, CURLOPT_FOLLOWLOCATION, 1L);
     if (code == CURLE_OK) {
-        code = curl_easy_setopt(curl, CURLOPT_MAXREDIRS, PKG_CURL_MAX_REDIRECTS);
+        code = PMSCurl().easy_setopt(curl, CURLOPT_MAXREDIRS, PKG_CURL_MAX_REDIRECTS);
     }
     if (code == CURLE_OK) {
-        code = curl_easy_setopt(curl, CURLOPT_REDIR_PROTOCOLS_STR, "http,https");
+        code = PMSCurl().easy_setopt(curl, CURLOPT_REDIR_PROTOCOLS_STR, "http,https");
     }
     if (code != CURLE_OK) {
         CORV_LOG_ERR("Failed to set %s, code=%d, err=%s", "CURLOPT_FOLLOWLOCATION", code,
-                     curl_easy_strerror(code));
+                     PMSCurl().easy_strerror(code));
         return false;
     }
     return true;
@@ -210,7 +211,7 @@ int PMSCurlSetUserAgent(void* curl) {
                      VLIBCErrorGetLine());
         return 0;
     }
-    CURLcode code = curl_easy_setopt(static_cast<CURL*>(curl), CURLOPT_USERAGENT, agent);
+    CURLcode code = PMSCurl().easy_setopt(static_cast<CURL*>(curl), CURLOPT_USERAGENT, agent);
     return code == CURLE_OK ? 0 : static_cast<int>(code);
 }
 
@@ -222,30 +223,30 @@ bool PMSCurlSetupConfig(void* handle, const char* url) {
     int agent = PMSCurlSetUserAgent(curl);
     if (agent != 0) {
         CORV_LOG_ERR("Failed to set time-out, return value=%d, err=%s", agent,
-                     curl_easy_strerror(static_cast<CURLcode>(agent)));
+                     PMSCurl().easy_strerror(static_cast<CURLcode>(agent)));
         return false;
     }
-    CURLcode code = curl_easy_setopt(curl, CURLOPT_URL, url);
+    CURLcode code = PMSCurl().easy_setopt(curl, CURLOPT_URL, url);
     if (code != CURLE_OK) {
         CORV_LOG_ERR("Failed to set url to %s, code=%d, err=%s", url, code,
-                     curl_easy_strerror(code));
+                     PMSCurl().easy_strerror(code));
         return false;
     }
     if (!setRedirectOptions(curl) || !setTlsOptions(curl)) {
         return false;
     }
     // A slow store only slows the caller down, so a failed limit is no reason to stop.
-    if ((code = curl_easy_setopt(curl, CURLOPT_LOW_SPEED_LIMIT, PKG_CURL_LOW_SPEED_LIMIT)) !=
+    if ((code = PMSCurl().easy_setopt(curl, CURLOPT_LOW_SPEED_LIMIT, PKG_CURL_LOW_SPEED_LIMIT)) !=
             CURLE_OK ||
-        (code = curl_easy_setopt(curl, CURLOPT_LOW_SPEED_TIME, PKG_CURL_LOW_SPEED_TIME)) !=
+        (code = PMSCurl().easy_setopt(curl, CURLOPT_LOW_SPEED_TIME, PKG_CURL_LOW_SPEED_TIME)) !=
             CURLE_OK) {
         CORV_LOG_ERR("Failed to set time-out, return value=%d, err=%s", code,
-                     curl_easy_strerror(code));
+                     PMSCurl().easy_strerror(code));
     }
-    code = curl_easy_setopt(curl, CURLOPT_CONNECTTIMEOUT, PKG_CURL_CONNECT_TIMEOUT);
+    code = PMSCurl().easy_setopt(curl, CURLOPT_CONNECTTIMEOUT, PKG_CURL_CONNECT_TIMEOUT);
     if (code != CURLE_OK) {
         CORV_LOG_ERR("Failed to set time-out, return value=%d, err=%s", code,
-                     curl_easy_strerror(code));
+                     PMSCurl().easy_strerror(code));
         return false;
     }
     return true;
@@ -255,8 +256,8 @@ bool PMSCurlInitHandle(void** curl, const char* url) {
     if (curl == nullptr) {
         return false;
     }
-    curl_global_init(CURL_GLOBAL_ALL);
-    *curl = curl_easy_init();
+    PMSCurl().global_init(CURL_GLOBAL_ALL);
+    *curl = PMSCurl().easy_init();
     if (*curl == nullptr) {
         CORV_LOG_ERR("Failed to init curl.");
         return false;
@@ -290,7 +291,7 @@ bool PMSCurlEncodeParams(void* curl, VLIBSZHASH* params, char** buffer, int* len
             ok = false;
             break;
         }
-        char* escaped = curl_easy_escape(static_cast<CURL*>(curl), value, 0);
+        char* escaped = PMSCurl().easy_escape(static_cast<CURL*>(curl), value, 0);
         if (escaped == nullptr) {
             CORV_LOG_ERR("URL encoding failed: %s", value);
             ok = false;
@@ -302,7 +303,7 @@ bool PMSCurlEncodeParams(void* curl, VLIBSZHASH* params, char** buffer, int* len
             CORV_LOG_ERR("Fail to concat string");
             ok = false;
         }
-        curl_free(escaped);
+        PMSCurl().free(escaped);
     }
     VLIBCSzListFree(keys);
     return ok;
@@ -312,13 +313,13 @@ bool PMSCurlSetPostField(void* curl, VLIBSZHASH* params, char** buffer, int* len
     if (!PMSCurlEncodeParams(curl, params, buffer, length)) {
         return false;
     }
-    CURLcode code = curl_easy_setopt(static_cast<CURL*>(curl), CURLOPT_POSTFIELDS, *buffer);
+    CURLcode code = PMSCurl().easy_setopt(static_cast<CURL*>(curl), CURLOPT_POSTFIELDS, *buffer);
     if (code == CURLE_OK) {
-        code = curl_easy_setopt(static_cast<CURL*>(curl), CURLOPT_POST, 1L);
+        code = PMSCurl().easy_setopt(static_cast<CURL*>(curl), CURLOPT_POST, 1L);
     }
     if (code != CURLE_OK) {
         CORV_LOG_ERR("Failed to set POST parameters, code=%d, err=%s", code,
-                     curl_easy_strerror(code));
+                     PMSCurl().easy_strerror(code));
         return false;
     }
     return true;
@@ -362,8 +363,8 @@ bool applyParams(CURL* curl, const char* url, bool post, VLIBSZHASH* params, Tex
         return true;
     }
     if (!PMSCurlGetQueryURL(curl, url, params, getUrl) ||
-        curl_easy_setopt(curl, CURLOPT_URL, getUrl.c_str()) != CURLE_OK ||
-        curl_easy_setopt(curl, CURLOPT_HTTPGET, 1L) != CURLE_OK) {
+        PMSCurl().easy_setopt(curl, CURLOPT_URL, getUrl.c_str()) != CURLE_OK ||
+        PMSCurl().easy_setopt(curl, CURLOPT_HTTPGET, 1L) != CURLE_OK) {
         CORV_LOG_ERR("%s, Failed to set get parameters", url);
         return false;
     }
@@ -398,8 +399,8 @@ bool PMSDownloadSendRequest(const char* url, bool post, std::string& reply, VLIB
     ReplyBuffer body;
     CURLcode code = CURLE_OK;
     for (int attempt = 0; attempt < PKG_CURL_ATTEMPTS; ++attempt) {
-        curl_easy_setopt(curl, CURLOPT_WRITEFUNCTION, appendReply);
-        curl_easy_setopt(curl, CURLOPT_WRITEDATA, &body);
+        PMSCurl().easy_setopt(curl, CURLOPT_WRITEFUNCTION, appendReply);
+        PMSCurl().easy_setopt(curl, CURLOPT_WRITEDATA, &body);
         code = performWithDnsFallback(curl);
         if (!isRetryable(code)) {
             break;
@@ -410,7 +411,8 @@ bool PMSDownloadSendRequest(const char* url, bool post, std::string& reply, VLIB
         CORV_LOG_ERR("Reply of %s is larger than %zu bytes; cut off", url, PKG_CURL_REPLY_LIMIT);
     }
     if (code != CURLE_OK) {
-        CORV_LOG_ERR("Failed to download %s, code=%d, err=%s", url, code, curl_easy_strerror(code));
+        CORV_LOG_ERR("Failed to download %s, code=%d, err=%s", url, code,
+                     PMSCurl().easy_strerror(code));
         g_lastFailure = describeCurlFailure(code, body.overLimit);
         if (isRetryable(code)) {
             reply = unreachableReply();
@@ -418,10 +420,10 @@ bool PMSDownloadSendRequest(const char* url, bool post, std::string& reply, VLIB
         return false;
     }
     long status = 0;
-    code = curl_easy_getinfo(curl, CURLINFO_RESPONSE_CODE, &status);
+    code = PMSCurl().easy_getinfo(curl, CURLINFO_RESPONSE_CODE, &status);
     if (code != CURLE_OK) {
         CORV_LOG_ERR("%s, Failed to curl_easy_getinfo, code=%d, err=%s", url, code,
-                     curl_easy_strerror(code));
+                     PMSCurl().easy_strerror(code));
         return false;
     }
     if (status != 200) {
@@ -446,10 +448,10 @@ bool readTransferInfo(CURL* curl, const char* url, std::string* contentType,
     char* text = nullptr;
     CURLcode code;
     if (contentType != nullptr) {
-        if ((code = curl_easy_getinfo(curl, CURLINFO_CONTENT_TYPE, &text)) != CURLE_OK) {
+        if ((code = PMSCurl().easy_getinfo(curl, CURLINFO_CONTENT_TYPE, &text)) != CURLE_OK) {
             g_transportResult = PKG_ERR_SYSTEM;
             CORV_LOG_ERR("%s, err in CURLINFO_CONTENT_TYPE, code=%d, err=%s", url, code,
-                         curl_easy_strerror(code));
+                         PMSCurl().easy_strerror(code));
             return false;
         }
         if (text != nullptr) {
@@ -458,10 +460,10 @@ bool readTransferInfo(CURL* curl, const char* url, std::string* contentType,
     }
     if (effectiveUrl != nullptr) {
         text = nullptr;
-        if ((code = curl_easy_getinfo(curl, CURLINFO_EFFECTIVE_URL, &text)) != CURLE_OK) {
+        if ((code = PMSCurl().easy_getinfo(curl, CURLINFO_EFFECTIVE_URL, &text)) != CURLE_OK) {
             g_transportResult = PKG_ERR_SYSTEM;
             CORV_LOG_ERR("%s, err in CURLINFO_EFFECTIVE_URL, code=%d, err=%s", url, code,
-                         curl_easy_strerror(code));
+                         PMSCurl().easy_strerror(code));
             return false;
         }
         if (text != nullptr) {
@@ -481,7 +483,7 @@ int downloadAttempts(CURL* curl, const char* path) {
             CORV_LOG_ERR("faile to open %s, %m", path);
             return -1;
         }
-        curl_easy_setopt(curl, CURLOPT_WRITEDATA, file);
+        PMSCurl().easy_setopt(curl, CURLOPT_WRITEDATA, file);
         code = performWithDnsFallback(curl);
         fclose(file);
         if (!isRetryable(code)) {
@@ -503,10 +505,11 @@ bool PMSDownloadFile(const char* url, const char* path, std::string* contentType
     }
     CURL* curl = handle.get();
     if (timeoutSeconds != nullptr) {
-        CURLcode set = curl_easy_setopt(curl, CURLOPT_TIMEOUT, static_cast<long>(*timeoutSeconds));
+        CURLcode set =
+            PMSCurl().easy_setopt(curl, CURLOPT_TIMEOUT, static_cast<long>(*timeoutSeconds));
         if (set != CURLE_OK) {
             CORV_LOG_ERR("Failed to set time-out, return value=%d, err=%s", set,
-                         curl_easy_strerror(set));
+                         PMSCurl().easy_strerror(set));
         }
     }
     // The file often does not exist yet; then nothing is locked and the download goes on.
@@ -516,13 +519,13 @@ bool PMSDownloadFile(const char* url, const char* path, std::string* contentType
     if (!ok) {
         g_transportResult = PKG_ERR_SERVER;
         CORV_LOG_ERR("Failed to download %s, code=%d, err=%s", url, code,
-                     code < 0 ? "cannot open the file" : curl_easy_strerror((CURLcode)code));
+                     code < 0 ? "cannot open the file" : PMSCurl().easy_strerror((CURLcode)code));
         g_lastFailure = code < 0 ? std::string("cannot write ") + path
                                  : describeCurlFailure((CURLcode)code, false);
     }
     long status = 0;
-    if (ok &&
-        (curl_easy_getinfo(curl, CURLINFO_RESPONSE_CODE, &status) != CURLE_OK || status != 200)) {
+    if (ok && (PMSCurl().easy_getinfo(curl, CURLINFO_RESPONSE_CODE, &status) != CURLE_OK ||
+               status != 200)) {
         g_transportResult = PKG_ERR_SERVER;
         CORV_LOG_ERR("%s, Failed to request packages, httpResponseCode=%ld", url, status);
         g_lastFailure = "the server answered HTTP " + std::to_string(status);

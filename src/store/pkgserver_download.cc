@@ -1,6 +1,5 @@
 // The transfer of a package file from a store into a temporary folder, under the task
 // record that the desktop polls.
-#include <curl/curl.h>
 #include <signal.h>
 #include <stdio.h>
 #include <string.h>
@@ -17,6 +16,7 @@
 #include "corvpkg/packagemanager.h"
 #include "corvpkg/pkgcurltool.h"
 #include "corvpkg/pkgserver.h"
+#include "store/curl_api.h"
 #include "store/digest_pipe.h"
 #include "store/pkgserver_private.h"
 
@@ -55,7 +55,7 @@ struct CurlOwner {
     CURL* curl;
     ~CurlOwner() {
         if (curl != nullptr) {
-            curl_easy_cleanup(curl);
+            PMSCurl().easy_cleanup(curl);
         }
     }
 };
@@ -159,32 +159,34 @@ bool downloadFields(PVLIBSZHASH* fields, const char* displayName) {
 
 bool setTransferOptions(CURL* curl, Transfer& t) {
     CURLcode rc;
-    if ((rc = curl_easy_setopt(curl, CURLOPT_WRITEFUNCTION, writeChunk)) != CURLE_OK ||
-        (rc = curl_easy_setopt(curl, CURLOPT_WRITEDATA, &t)) != CURLE_OK) {
-        CORV_LOG_ERR("Failed to set write data, code=%d, err=%s", rc, curl_easy_strerror(rc));
+    if ((rc = PMSCurl().easy_setopt(curl, CURLOPT_WRITEFUNCTION, writeChunk)) != CURLE_OK ||
+        (rc = PMSCurl().easy_setopt(curl, CURLOPT_WRITEDATA, &t)) != CURLE_OK) {
+        CORV_LOG_ERR("Failed to set write data, code=%d, err=%s", rc, PMSCurl().easy_strerror(rc));
         return false;
     }
-    if ((rc = curl_easy_setopt(curl, CURLOPT_NOPROGRESS, 0L)) != CURLE_OK) {
-        CORV_LOG_ERR("Failed to set progress option, code=%d, err=%s", rc, curl_easy_strerror(rc));
+    if ((rc = PMSCurl().easy_setopt(curl, CURLOPT_NOPROGRESS, 0L)) != CURLE_OK) {
+        CORV_LOG_ERR("Failed to set progress option, code=%d, err=%s", rc,
+                     PMSCurl().easy_strerror(rc));
         return false;
     }
-    if ((rc = curl_easy_setopt(curl, CURLOPT_XFERINFOFUNCTION, reportProgress)) != CURLE_OK) {
+    if ((rc = PMSCurl().easy_setopt(curl, CURLOPT_XFERINFOFUNCTION, reportProgress)) != CURLE_OK) {
         CORV_LOG_ERR("Failed to set progress function, code=%d, err=%s", rc,
-                     curl_easy_strerror(rc));
+                     PMSCurl().easy_strerror(rc));
         return false;
     }
-    if ((rc = curl_easy_setopt(curl, CURLOPT_XFERINFODATA, &t)) != CURLE_OK) {
-        CORV_LOG_ERR("Failed to set progress data, code=%d, err=%s", rc, curl_easy_strerror(rc));
+    if ((rc = PMSCurl().easy_setopt(curl, CURLOPT_XFERINFODATA, &t)) != CURLE_OK) {
+        CORV_LOG_ERR("Failed to set progress data, code=%d, err=%s", rc,
+                     PMSCurl().easy_strerror(rc));
         return false;
     }
     // Bigger reads mean fewer write calls for a package of many megabytes.
-    curl_easy_setopt(curl, CURLOPT_BUFFERSIZE, 256L * 1024);
+    PMSCurl().easy_setopt(curl, CURLOPT_BUFFERSIZE, 256L * 1024);
     return true;
 }
 
 // One attempt, with the fallback name server after a name that can't be resolved.
 CURLcode performOnce(CURL* curl) {
-    return PMSRetryWithFallbackDns(curl, curl_easy_perform(curl));
+    return PMSRetryWithFallbackDns(curl, PMSCurl().easy_perform(curl));
 }
 
 // Up to 4 attempts; a retried attempt starts the file and the digest again from zero.
@@ -197,9 +199,9 @@ bool performAttempts(CURL* curl, Transfer& t, const std::string& url) {
         }
         if (!isRetried(rc)) {
             CORV_LOG_ERR("Failed to curl perform, code=%d, err=%s, url=%s", rc,
-                         curl_easy_strerror(rc), url.c_str());
-            PMSSetLastStoreFailure(std::string("the transfer failed (") + curl_easy_strerror(rc) +
-                                   ")");
+                         PMSCurl().easy_strerror(rc), url.c_str());
+            PMSSetLastStoreFailure(std::string("the transfer failed (") +
+                                   PMSCurl().easy_strerror(rc) + ")");
             return false;
         }
         if (fflush(t.file) != 0 || ftruncate(fileno(t.file), 0) != 0 ||
@@ -210,10 +212,10 @@ bool performAttempts(CURL* curl, Transfer& t, const std::string& url) {
         sleep(1);
     }
     long status = 0;
-    CURLcode info = curl_easy_getinfo(curl, CURLINFO_RESPONSE_CODE, &status);
+    CURLcode info = PMSCurl().easy_getinfo(curl, CURLINFO_RESPONSE_CODE, &status);
     if (info != CURLE_OK) {
         CORV_LOG_ERR("Failed to curl_easy_getinfo, code=%d, err=%s, url=%s", info,
-                     curl_easy_strerror(info), url.c_str());
+                     PMSCurl().easy_strerror(info), url.c_str());
         return false;
     }
     if (status != 200) {
@@ -221,7 +223,7 @@ bool performAttempts(CURL* curl, Transfer& t, const std::string& url) {
                      url.c_str());
         PMSSetLastStoreFailure(rc == CURLE_OK ? "the server answered HTTP " + std::to_string(status)
                                               : std::string("the server could not be reached (") +
-                                                    curl_easy_strerror(rc) + ")");
+                                                    PMSCurl().easy_strerror(rc) + ")");
         return false;
     }
     return true;
@@ -244,7 +246,7 @@ bool transfer(NOS::Task* task, bool blqinst, const char* displayName, const char
         CORV_LOG_ERR("Failed to open temp file [%s] [%m]", filePath.c_str());
         return false;
     }
-    CurlOwner handle{curl_easy_init()};
+    CurlOwner handle{PMSCurl().easy_init()};
     if (handle.curl == nullptr || !t.restart()) {
         CORV_LOG_ERR("Failed to init curl.");
         return false;

@@ -12,9 +12,11 @@
 #include <string>
 #include <vector>
 
+#include "corv/vlibc.h"
 #include "corvpkg/json_util.h"
 #include "corvpkg/packagemanager.h"
 #include "corvpkg/pkgvolume.h"
+#include "support/codesign_kit.h"
 #include "support/files.h"
 #include "support/lifecycle_kit.h"
 #include "support/pkg_kit.h"
@@ -45,6 +47,18 @@ int status(const std::string& name) {
     return PackageManager().getPkgStatus(name);
 }
 
+// A copy of the package file `file` at `copy` whose INFO claims another payload checksum.
+void withWrongChecksum(const std::string& file, const std::string& copy) {
+    std::string info = testutil::tarMember(file, "INFO");
+    const size_t at = info.find("checksum=\"");
+    ASSERT_NE(at, std::string::npos) << info;
+    info.replace(at + 10, 32, std::string(32, '0'));
+    testutil::writeFile("/tmp/stage/INFO", info);
+    ASSERT_EQ(VLIBCExec("/bin/cp", file.c_str(), copy.c_str(), nullptr), 0);
+    ASSERT_EQ(VLIBCExec("/bin/tar", "--delete", "-f", copy.c_str(), "INFO", nullptr), 0);
+    ASSERT_EQ(VLIBCExec("/bin/tar", "rf", copy.c_str(), "-C", "/tmp/stage", "INFO", nullptr), 0);
+}
+
 }  // namespace
 
 TEST(CliLifecycle, InstallReinstallDowngradeUninstall) {
@@ -65,6 +79,15 @@ TEST(CliLifecycle, InstallReinstallDowngradeUninstall) {
     ASSERT_EQ(r.status, 0) << r.err;
     EXPECT_EQ(r.out, "upgraded demo\n");
     EXPECT_EQ(testutil::scriptsRan("demo").front(), "preupgrade");
+
+    // A damaged payload is refused before the installed package is stopped.
+    testutil::clearRecords("demo");
+    withWrongChecksum(v2, "/tmp/damaged-v2.cpk");
+    r = corvpkg({"upgrade", "/tmp/damaged-v2.cpk", "--no-verify", "--json"});
+    EXPECT_EQ(r.status, 1);
+    EXPECT_EQ(json(r)["name"].asString(), "PKG_ERR_BAD_ARCHIVE");
+    EXPECT_TRUE(testutil::scriptsRan("demo").empty());
+    EXPECT_EQ(status("demo"), 0);
 
     const std::string v1 = testutil::buildPackage(testutil::recordingPackage("demo", "1.0-0001"));
     r = corvpkg({"install", v1, "--no-verify", "--json"});
@@ -139,6 +162,10 @@ TEST(CliLifecycle, BadInputIsRefusedClearly) {
     arm.info["arch"] = "armv5";
     const std::string armFile = testutil::buildPackage(arm);
     ASSERT_EQ(mkdir("/tmp/a-dir", 0755), 0);
+    // A damaged payload is named first, before what else is wrong with the file, and
+    // whether the install or its check finds it.
+    withWrongChecksum(file, "/tmp/damaged.cpk");
+    withWrongChecksum(armFile, "/tmp/damaged-arm.cpk");
     struct Case {
         std::vector<std::string> args;
         const char* name;
@@ -148,6 +175,9 @@ TEST(CliLifecycle, BadInputIsRefusedClearly) {
         {{"install", "/tmp/a-dir"}, "PKG_ERR_FILE_ACCESS"},
         {{"install", file, "--answers", "/tmp/answers.txt"}, "PKG_ERR_BAD_ANSWERS"},
         {{"install", armFile, "--no-verify"}, "PKG_ERR_PLATFORM"},
+        {{"install", "/tmp/damaged.cpk", "--no-verify"}, "PKG_ERR_BAD_ARCHIVE"},
+        {{"install", "/tmp/damaged-arm.cpk", "--no-verify"}, "PKG_ERR_BAD_ARCHIVE"},
+        {{"check", "/tmp/damaged-arm.cpk"}, "PKG_ERR_BAD_ARCHIVE"},
         {{"uninstall", "nosuch"}, "PKG_ERR_NOT_INSTALLED"},
     };
     for (const Case& c : cases) {
@@ -159,6 +189,8 @@ TEST(CliLifecycle, BadInputIsRefusedClearly) {
         EXPECT_EQ(json(r)["name"].asString(), c.name) << r.out;
     }
     EXPECT_EQ(PackageManager().enumPackages(nullptr, PKG_INFO_MASK_ALL).size(), 0u);
+    EXPECT_FALSE(std::filesystem::exists("/volume1/@appstore/demo"));
+    EXPECT_FALSE(std::filesystem::exists("/tmp/demo.scripts")) << "a script ran";
 }
 
 TEST(CliLifecycle, NameThatLooksLikeAnOptionIsReachedAfterTheDoubleDash) {

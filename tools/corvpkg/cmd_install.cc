@@ -55,10 +55,6 @@ bool readAnswers(const std::string& path, Json::Value& answers) {
     return fromString(text.str(), answers) && answers.isObject();
 }
 
-bool isSignatureVerdict(PKG_ERRCODE code) {
-    return code >= PKG_ERR_NOT_MAKER_SIGNED && code <= PKG_ERR_SIGNATURE_SYSTEM;
-}
-
 // Answers for every question of the wizard, from --answers, --defaults or the terminal.
 // -1 when they are complete, else the exit status of the refusal already printed.
 int completeAnswers(const CommonOptions& opts, const Command& self, const PackageInfo& withWizard,
@@ -163,17 +159,36 @@ int installCommand(const std::vector<std::string>& args, const char* command) {
     ProgressDisplay display(command, unpackSizeOf(file));
     display.phase("checking");
 
-    // The installability checks, so that a refusal comes with the desktop's report.
+    // The record with licence and wizard is read first, and the checks judge that same
+    // record: the file's members are unpacked once for both. A file whose record does not
+    // read that way is read again by the checks, which then tell why.
+    PackageManager pm;
+    PackageInfo withWizard;
+    const bool queried = pm.queryPackageFileInfoWithWizard(
+        file, withWizard, static_cast<PKG_INSTALLATION_TYPE>(0), lang.c_str());
+
+    // The installability checks, so that a refusal comes with the desktop's report. The
+    // signature is not asked for when the file goes on unverified anyway. The payload is
+    // hashed by the install itself, beside its unpacking, unless the package asks
+    // questions first: nobody is asked about a package whose payload is damaged.
     PackageInfo info;
+    unsigned int skip = verify ? PKG_FILE_CHECK_SKIP_NONE : PKG_FILE_CHECK_SKIP_SIGNATURE;
+    if (queried) {
+        info = withWizard;
+        if (withWizard.wizard.empty()) {
+            skip |= PKG_FILE_CHECK_SKIP_PAYLOAD;
+            pm.setChecksumWhileUnpacking(true);
+        }
+    }
     PKG_ERRCODE code = PKG_OK;
     Json::Value data;
     std::string displayName;
     const bool installable =
-        CheckPackageFileInfoImpl(lang.c_str(), file.c_str(), displayName, code, data, info);
+        CheckPackageFileInfoImpl(lang.c_str(), file.c_str(), displayName, code, data, info, skip);
     failureContext()["package"] = info.package;
-    if (!installable && !(isSignatureVerdict(code) && !verify)) {
+    if (!installable) {
         Json::Value report(Json::arrayValue);
-        CheckPackageFileInfo(lang.c_str(), file.c_str(), displayName, report);
+        CheckPackageFileReport(code, data, info, report);
         Json::Value details(Json::objectValue);
         details["report"] = report;
         if (!data.isNull()) {
@@ -187,10 +202,6 @@ int installCommand(const std::vector<std::string>& args, const char* command) {
                             details);
     }
 
-    PackageManager pm;
-    PackageInfo withWizard;
-    pm.queryPackageFileInfoWithWizard(file, withWizard, static_cast<PKG_INSTALLATION_TYPE>(0),
-                                      lang.c_str());
     if (int status = completeAnswers(opts, findCommand(command), withWizard, answers, display);
         status >= 0) {
         return status;

@@ -142,7 +142,7 @@ int cmdCheck(const std::vector<std::string>& args) {
     bool ok = CheckPackageFileInfoImpl(lang.c_str(), file.c_str(), displayName, code, data, info);
     Json::Value report(Json::arrayValue);
     if (!ok) {
-        CheckPackageFileInfo(lang.c_str(), file.c_str(), displayName, report);
+        CheckPackageFileReport(code, data, info, report);
     }
     if (opts.json) {
         Json::Value out(Json::objectValue);

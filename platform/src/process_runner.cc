@@ -374,6 +374,74 @@ class Collector {
     std::vector<char> buffer_;
 };
 
+// How a wait for the child ended.
+enum class Waited { kExited, kTimedOut, kFailed };
+
+// Reads the child's output while it runs, until it ends (its wait status in `status`) or
+// `timeoutSeconds` pass (0: no limit). The pidfd, where the kernel has one, wakes the poll
+// at the child's end; without it the poll wakes every kReapPollMs to look.
+Waited collectUntilExit(pid_t pid, int timeoutSeconds, Stream (&streams)[2], Collector& collector,
+                        int& status) {
+    const Clock::time_point deadline = Clock::now() + std::chrono::seconds(timeoutSeconds);
+    Fd exitFd(processHandle(pid));
+    for (;;) {
+        // The child's end; after it only what the pipes hold already is read.
+        pid_t reaped = waitpid(pid, &status, WNOHANG);
+        if (reaped == pid) {
+            for (Stream& s : streams) {
+                if (s.fd->get() >= 0) {
+                    collector.drain(s);
+                }
+            }
+            return Waited::kExited;
+        }
+        if (reaped < 0 && errno != EINTR) {
+            return Waited::kFailed;
+        }
+        int timeoutMs = -1;
+        if (timeoutSeconds > 0) {
+            auto left =
+                std::chrono::duration_cast<std::chrono::milliseconds>(deadline - Clock::now());
+            if (left.count() <= 0) {
+                return Waited::kTimedOut;
+            }
+            timeoutMs = static_cast<int>(left.count());
+        }
+        if (exitFd.get() < 0 && (timeoutMs < 0 || timeoutMs > kReapPollMs)) {
+            timeoutMs = kReapPollMs;
+        }
+        struct pollfd pfds[3];
+        Stream* owners[3] = {};
+        nfds_t n = 0;
+        for (Stream& s : streams) {
+            if (s.fd->get() >= 0) {
+                owners[n] = &s;
+                pfds[n++] = {s.fd->get(), POLLIN, 0};
+            }
+        }
+        if (exitFd.get() >= 0) {
+            pfds[n++] = {exitFd.get(), POLLIN, 0};
+        }
+        if (n == 0) {
+            // Nothing to read and nothing to wake us: the child's end is all there is.
+            if (timeoutSeconds == 0 && waitBlocking(pid, &status) == pid) {
+                return Waited::kExited;
+            }
+            poll(nullptr, 0, timeoutMs);
+            continue;
+        }
+        if (poll(pfds, n, timeoutMs) < 0) {
+            continue;  // EINTR; anything else shows again at waitpid
+        }
+        for (nfds_t i = 0; i < n; ++i) {
+            if (owners[i] != nullptr && (pfds[i].revents & (POLLIN | POLLHUP | POLLERR)) &&
+                !collector.readSome(*owners[i])) {
+                owners[i]->fd->reset();
+            }
+        }
+    }
+}
+
 }  // namespace
 
 ProcessRunner::ProcessRunner(std::string program, std::vector<std::string> args)
@@ -493,8 +561,6 @@ int ProcessRunner::run(int, bool wait, bool capture, int fd) {
         return 0;
     }
 
-    const Clock::time_point deadline = Clock::now() + std::chrono::seconds(timeout_);
-    Fd exitFd(processHandle(pid_));
     Collector collector(fd);
     Stream streams[] = {{&out.read, &out_}, {&err.read, &err_}};
     for (Stream& s : streams) {
@@ -503,63 +569,15 @@ int ProcessRunner::run(int, bool wait, bool capture, int fd) {
         }
     }
     int status = 0;
-    for (;;) {
-        // The child's end; after it only what the pipes hold already is read.
-        pid_t reaped = waitpid(pid_, &status, WNOHANG);
-        if (reaped == pid_) {
-            for (Stream& s : streams) {
-                if (s.fd->get() >= 0) {
-                    collector.drain(s);
-                }
-            }
+    switch (collectUntilExit(pid_, timeout_, streams, collector, status)) {
+        case Waited::kExited:
             return exitOf(status);
-        }
-        if (reaped < 0 && errno != EINTR) {
+        case Waited::kFailed:
             CORV_LOG_ERR("Failed to wait for %s, %m", program_.c_str());
             VLIBCErrSet(ERR_BAD_PARAMETERS);
             return -1;
-        }
-        int timeoutMs = -1;
-        if (timeout_ > 0) {
-            auto left =
-                std::chrono::duration_cast<std::chrono::milliseconds>(deadline - Clock::now());
-            if (left.count() <= 0) {
-                break;
-            }
-            timeoutMs = static_cast<int>(left.count());
-        }
-        if (exitFd.get() < 0 && (timeoutMs < 0 || timeoutMs > kReapPollMs)) {
-            timeoutMs = kReapPollMs;
-        }
-        struct pollfd pfds[3];
-        Stream* owners[3] = {};
-        nfds_t n = 0;
-        for (Stream& s : streams) {
-            if (s.fd->get() >= 0) {
-                owners[n] = &s;
-                pfds[n++] = {s.fd->get(), POLLIN, 0};
-            }
-        }
-        if (exitFd.get() >= 0) {
-            pfds[n++] = {exitFd.get(), POLLIN, 0};
-        }
-        if (n == 0) {
-            // Nothing to read and nothing to wake us: the child's end is all there is.
-            if (timeout_ == 0 && waitBlocking(pid_, &status) == pid_) {
-                return exitOf(status);
-            }
-            poll(nullptr, 0, timeoutMs);
-            continue;
-        }
-        if (poll(pfds, n, timeoutMs) < 0) {
-            continue;  // EINTR; anything else shows again at waitpid
-        }
-        for (nfds_t i = 0; i < n; ++i) {
-            if (owners[i] != nullptr && (pfds[i].revents & (POLLIN | POLLHUP | POLLERR)) &&
-                !collector.readSome(*owners[i])) {
-                owners[i]->fd->reset();
-            }
-        }
+        case Waited::kTimedOut:
+            break;
     }
 
     CORV_LOG_ERR("%s did not end within %d seconds, killed", program_.c_str(), timeout_);

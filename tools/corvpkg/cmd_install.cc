@@ -127,6 +127,80 @@ int completeAnswers(const CommonOptions& opts, const Command& self, const Packag
     return usageError(self, message);
 }
 
+// Reads the file's record with its wizard and runs the installability checks on that
+// record. -1 when the file can be installed (and `pm` knows whether to hash the payload
+// while it unpacks), else the exit status of the refusal, printed.
+int checkInstallable(const CommonOptions& opts, const std::string& file, const std::string& lang,
+                     bool verify, ProgressDisplay& display, PackageManager& pm,
+                     PackageInfo& withWizard, PackageInfo& info) {
+    // The record with licence and wizard is read first, and the checks judge that same
+    // record: the file's members are unpacked once for both. A file whose record does not
+    // read that way is read again by the checks, which then tell why.
+    const bool queried = pm.queryPackageFileInfoWithWizard(
+        file, withWizard, static_cast<PKG_INSTALLATION_TYPE>(0), lang.c_str());
+
+    // The installability checks, so that a refusal comes with the desktop's report. The
+    // signature is not asked for when the file goes on unverified anyway. The payload is
+    // hashed by the install itself, beside its unpacking, unless the package asks
+    // questions first: nobody is asked about a package whose payload is damaged.
+    unsigned int skip = verify ? PKG_FILE_CHECK_SKIP_NONE : PKG_FILE_CHECK_SKIP_SIGNATURE;
+    if (queried) {
+        info = withWizard;
+        if (withWizard.wizard.empty()) {
+            skip |= PKG_FILE_CHECK_SKIP_PAYLOAD;
+            pm.setChecksumWhileUnpacking(true);
+        }
+    }
+    PKG_ERRCODE code = PKG_OK;
+    Json::Value data;
+    std::string displayName;
+    const bool installable =
+        CheckPackageFileInfoImpl(lang.c_str(), file.c_str(), displayName, code, data, info, skip);
+    failureContext()["package"] = info.package;
+    if (!installable) {
+        Json::Value report(Json::arrayValue);
+        CheckPackageFileReport(code, data, info, report);
+        Json::Value details(Json::objectValue);
+        details["report"] = report;
+        if (!data.isNull()) {
+            details["data"] = data;
+        }
+        std::string text;
+        joinJsonArray(report, " ", text);
+        display.breakLine();
+        failureContext()["operation"] = "check";
+        return printFailure(opts.json, code, verbosity().verbose ? "not installable: " + text : "",
+                            details);
+    }
+    return -1;
+}
+
+// The package's message file as it stood before an operation: only words that this
+// operation wrote are its message now.
+class MessageWatch {
+  public:
+    explicit MessageWatch(std::string path) : path_(std::move(path)), before_(stampOf(path_)) {
+        PMReadFile(path_.c_str(), 0x10000, earlier_, nullptr);
+    }
+    std::string newWords() const {
+        std::string message;
+        if (!(stampOf(path_) != before_)) {
+            return message;
+        }
+        PMReadFile(path_.c_str(), 0x10000, message, nullptr);
+        // A script that appends leaves the words of earlier operations in front.
+        if (!earlier_.empty() && message.compare(0, earlier_.size(), earlier_) == 0) {
+            message.erase(0, earlier_.size());
+        }
+        return message;
+    }
+
+  private:
+    std::string path_;
+    FileStamp before_;
+    std::string earlier_;
+};
+
 int installCommand(const std::vector<std::string>& args, const char* command) {
     CommonOptions opts;
     if (int status = parseSingle(args, command, "package file or name", opts,
@@ -159,47 +233,12 @@ int installCommand(const std::vector<std::string>& args, const char* command) {
     ProgressDisplay display(command, unpackSizeOf(file));
     display.phase("checking");
 
-    // The record with licence and wizard is read first, and the checks judge that same
-    // record: the file's members are unpacked once for both. A file whose record does not
-    // read that way is read again by the checks, which then tell why.
     PackageManager pm;
     PackageInfo withWizard;
-    const bool queried = pm.queryPackageFileInfoWithWizard(
-        file, withWizard, static_cast<PKG_INSTALLATION_TYPE>(0), lang.c_str());
-
-    // The installability checks, so that a refusal comes with the desktop's report. The
-    // signature is not asked for when the file goes on unverified anyway. The payload is
-    // hashed by the install itself, beside its unpacking, unless the package asks
-    // questions first: nobody is asked about a package whose payload is damaged.
     PackageInfo info;
-    unsigned int skip = verify ? PKG_FILE_CHECK_SKIP_NONE : PKG_FILE_CHECK_SKIP_SIGNATURE;
-    if (queried) {
-        info = withWizard;
-        if (withWizard.wizard.empty()) {
-            skip |= PKG_FILE_CHECK_SKIP_PAYLOAD;
-            pm.setChecksumWhileUnpacking(true);
-        }
-    }
-    PKG_ERRCODE code = PKG_OK;
-    Json::Value data;
-    std::string displayName;
-    const bool installable =
-        CheckPackageFileInfoImpl(lang.c_str(), file.c_str(), displayName, code, data, info, skip);
-    failureContext()["package"] = info.package;
-    if (!installable) {
-        Json::Value report(Json::arrayValue);
-        CheckPackageFileReport(code, data, info, report);
-        Json::Value details(Json::objectValue);
-        details["report"] = report;
-        if (!data.isNull()) {
-            details["data"] = data;
-        }
-        std::string text;
-        joinJsonArray(report, " ", text);
-        display.breakLine();
-        failureContext()["operation"] = "check";
-        return printFailure(opts.json, code, verbosity().verbose ? "not installable: " + text : "",
-                            details);
+    if (int status = checkInstallable(opts, file, lang, verify, display, pm, withWizard, info);
+        status >= 0) {
+        return status;
     }
 
     if (int status = completeAnswers(opts, findCommand(command), withWizard, answers, display);
@@ -207,12 +246,7 @@ int installCommand(const std::vector<std::string>& args, const char* command) {
         return status;
     }
 
-    // The message file may hold the words of an earlier operation: only a file that
-    // this one wrote is the package's message now.
-    const std::string messageFile = pm.getFixedLogFilePath(info.package);
-    const FileStamp before = stampOf(messageFile);
-    std::string earlier;
-    PMReadFile(messageFile.c_str(), 0x10000, earlier, nullptr);
+    const MessageWatch watch(pm.getFixedLogFilePath(info.package));
     const bool wasInstalled = PMSCheckPackage(info.package);
     int outcome = 0;
     display.follow(info.package);
@@ -222,14 +256,7 @@ int installCommand(const std::vector<std::string>& args, const char* command) {
                          lang.c_str(), opts.has("--ignore-dependents"), verify);
     display.finish();
     removeResourceBackup(info.package);
-    std::string message;
-    if (stampOf(messageFile) != before) {
-        PMReadFile(messageFile.c_str(), 0x10000, message, nullptr);
-        // A script that appends leaves the words of earlier operations in front.
-        if (!earlier.empty() && message.compare(0, earlier.size(), earlier) == 0) {
-            message.erase(0, earlier.size());
-        }
-    }
+    const std::string message = watch.newWords();
     if (!message.empty() && !opts.json) {
         fprintf(stderr, "message from the package: %s\n", message.c_str());
     }

@@ -1,5 +1,4 @@
 // Reading a package file: single members through /bin/tar, never the whole archive.
-#include <openssl/evp.h>
 #include <stdio.h>
 #include <string.h>
 
@@ -7,6 +6,7 @@
 #include <vector>
 
 #include "catalogue/pkgchecksum.h"
+#include "common/md5.h"
 #include "corv/log.h"
 #include "corv/process_runner.h"
 #include "corv/vlibc.h"
@@ -121,28 +121,16 @@ std::string payloadChecksum(const std::string& cpkFile) {
     if (out == nullptr) {
         return "";
     }
-    EVP_MD_CTX* md5 = EVP_MD_CTX_new();
-    bool ok = md5 != nullptr && EVP_DigestInit_ex(md5, EVP_md5(), nullptr) == 1;
+    Md5 md5;
+    bool ok = md5.restart();
     std::vector<unsigned char> chunk(256 * 1024);
     size_t n;
     while ((n = fread(chunk.data(), 1, chunk.size(), out)) > 0) {
-        ok = ok && EVP_DigestUpdate(md5, chunk.data(), n) == 1;
+        md5.update(chunk.data(), n);
     }
     ok = !ferror(out) && VLIBCPclose(out) == 0 && ok;
-    unsigned char digest[EVP_MAX_MD_SIZE];
-    unsigned int size = 0;
-    ok = ok && EVP_DigestFinal_ex(md5, digest, &size) == 1;
-    EVP_MD_CTX_free(md5);
-    if (!ok) {
-        return "";
-    }
-    std::string hex;
-    for (unsigned int i = 0; i < size; ++i) {
-        char pair[3];
-        snprintf(pair, sizeof(pair), "%02x", digest[i]);
-        hex += pair;
-    }
-    return hex;
+    std::string hex = md5.hexDigest();
+    return ok ? hex : "";
 }
 
 }  // namespace

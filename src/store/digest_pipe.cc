@@ -13,11 +13,10 @@ constexpr size_t kMaxPending = 4;
 
 }  // namespace
 
-DigestPipe::DigestPipe() : ctx_(EVP_MD_CTX_new()) {}
+DigestPipe::DigestPipe() = default;
 
 DigestPipe::~DigestPipe() {
     stop();
-    EVP_MD_CTX_free(ctx_);
 }
 
 void DigestPipe::stop() {
@@ -37,11 +36,11 @@ bool DigestPipe::restart() {
     pending_.clear();
     filling_.clear();
     closing_ = false;
-    ok_ = ctx_ != nullptr && EVP_DigestInit_ex(ctx_, EVP_md5(), nullptr) == 1;
-    if (ok_) {
+    const bool ok = md5_.restart();
+    if (ok) {
         thread_ = std::thread([this] { run(); });
     }
-    return ok_;
+    return ok;
 }
 
 void DigestPipe::run() {
@@ -57,9 +56,7 @@ void DigestPipe::run() {
             pending_.pop_front();
         }
         changed_.notify_all();
-        if (EVP_DigestUpdate(ctx_, block.data(), block.size()) != 1) {
-            ok_ = false;
-        }
+        md5_.update(block.data(), block.size());
         block.clear();
         std::lock_guard<std::mutex> lock(mutex_);
         spare_.push_back(std::move(block));
@@ -101,20 +98,7 @@ std::string DigestPipe::finish() {
         submit();
     }
     stop();
-    unsigned char bytes[EVP_MAX_MD_SIZE];
-    unsigned int length = 0;
-    if (!ok_ || EVP_DigestFinal_ex(ctx_, bytes, &length) != 1) {
-        ok_ = false;
-        return "";
-    }
-    ok_ = false;
-    static const char kHex[] = "0123456789abcdef";
-    std::string hex;
-    for (unsigned int i = 0; i < length; ++i) {
-        hex += kHex[bytes[i] >> 4];
-        hex += kHex[bytes[i] & 0xF];
-    }
-    return hex;
+    return md5_.hexDigest();
 }
 
 }  // namespace CORVPackageTool

@@ -2,14 +2,14 @@
 // that hashing a package of many megabytes overlaps its receipt instead of following it.
 #pragma once
 
-#include <openssl/evp.h>
-
 #include <condition_variable>
 #include <deque>
 #include <mutex>
 #include <string>
 #include <thread>
 #include <vector>
+
+#include "common/md5.h"
 
 namespace CORVPackageTool {
 
@@ -34,8 +34,7 @@ class DigestPipe {
     void stop();
     void submit();
 
-    EVP_MD_CTX* ctx_;
-    bool ok_ = false;
+    Md5 md5_;  // touched by the hashing thread only while it runs
     Block filling_;
     std::vector<Block> spare_;
     std::deque<Block> pending_;

@@ -1,6 +1,5 @@
 // The query protocol of the store client: the fields of a request, the request token,
 // one entry of a list, and the hand-over of a feed's keys to the signature tool.
-#include <openssl/evp.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
@@ -9,6 +8,7 @@
 
 #include <memory>
 
+#include "common/md5.h"
 #include "corv/codesign.h"
 #include "corv/log.h"
 #include "corv/nsinfo.h"
@@ -77,15 +77,14 @@ bool PMSMd5Hex(const char* text, char* out, int outSize) {
     if (text == nullptr || out == nullptr || outSize < 33) {
         return false;
     }
-    unsigned char digest[EVP_MAX_MD_SIZE];
-    unsigned int length = 0;
-    if (EVP_Digest(text, strlen(text), digest, &length, EVP_md5(), nullptr) != 1 || length != 16) {
+    Md5 md5;
+    md5.restart();
+    md5.update(text, strlen(text));
+    const std::string hex = md5.hexDigest();
+    if (hex.size() != 32) {
         return false;
     }
-    for (unsigned int i = 0; i < length; ++i) {
-        snprintf(out + 2 * i, 3, "%02x", digest[i]);
-    }
-    out[32] = '\0';
+    memcpy(out, hex.c_str(), 33);
     return true;
 }
 
